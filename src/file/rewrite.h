@@ -1,0 +1,46 @@
+// The life cycle that the structured files share: load on open, write anew on close.
+#ifndef KORU_FILE_REWRITE_H
+#define KORU_FILE_REWRITE_H
+
+#include <cstddef>
+#include <memory>
+
+#include <koru/file.h>
+
+#include "file/fileguard.h"
+
+namespace Koru {
+
+/// Bytes that are ready to be written.
+struct Content {
+    std::unique_ptr<char[]> data;
+    std::size_t size = 0;
+};
+
+/// Opens the file, discards what was held in memory and loads the file if the mode says so.
+template <class Discard, class Load>
+void openAndLoad(File& file, unsigned long mode, Discard discard, Load load) {
+    FileGuard const guard(file);
+    file.File::open(mode);
+    discard();
+    if ((file.getMode() & File::READ) != 0) load();
+}
+
+/// Deletes the file and writes it anew with the mode of now; it is open afterwards.
+/// @throws std::runtime_error "failed to write to file", and what File::open and close throw
+void rewrite(File& file, Content const& content);
+
+/// Writes the file anew if the mode says so, then discards what was held in memory and closes.
+/// `prepare` gives the whole content before the old file is touched: what fails for want of memory
+/// fails while the old file is still there.
+template <class Prepare, class Discard>
+void writeBackAndClose(File& file, Prepare prepare, Discard discard) {
+    FileGuard const guard(file);
+    if ((file.getMode() & File::WRITE) != 0) rewrite(file, prepare());
+    discard();
+    file.File::close();
+}
+
+} // namespace Koru
+
+#endif

@@ -1,0 +1,171 @@
+#include <koru/initializationfile.h>
+
+#include <stdexcept>
+
+#include <koru/string.h>
+
+#include "file/quiet.h"
+#include "file/rewrite.h"
+#include "settings/lines.h"
+#include "settings/render.h"
+#include "settings/settingstable.h"
+
+namespace Koru {
+
+// For callers who take its address; the value stands in the header.
+unsigned long const InitializationFile::MAX_LINE_LENGTH;
+
+namespace {
+
+using Entry = SettingsTable::Entry;
+
+/// The name in a trimmed line that begins with "[": without the run of "]" at its end, then without
+/// the run of "[" at its start, unless nothing else is left. Nothing more is asked of a header.
+std::string_view _sectionName(std::string_view line) {
+    std::string_view const opened = line.substr(0, line.find_last_not_of(']') + 1);
+    std::size_t const name = opened.find_first_not_of('[');
+    return name == std::string_view::npos ? opened : opened.substr(name);
+}
+
+/// Loads lines into a table, section by section.
+class Loader {
+public:
+    explicit Loader(SettingsTable& table) : table_(table) {}
+
+    void load(FileBytes const& bytes) {
+        eachLine(bytes, [this](std::string_view line) { _parse(trim(line)); });
+    }
+
+private:
+    void _parse(std::string_view line) {
+        if (isComment(line)) return;
+        if (line.front() == '[') {
+            section_ = table_.keep(_sectionName(line));
+            sectionIsKnown_ = false;
+            return;
+        }
+        std::size_t const equals = line.find('=');
+        if (equals == std::string_view::npos) return;
+        StoredText const key = table_.keep(line.substr(0, equals));
+        if (key.empty() || section_.empty()) return;
+        // Neither is trimmed: blanks around "=" belong to key and value.
+        table_.append(Entry{_sectionNumber(), key, table_.keep(line.substr(equals + 1))});
+    }
+
+    /// The table learns a section's name with its first entry, for it exists only with entries.
+    std::uint32_t _sectionNumber() {
+        if (!sectionIsKnown_) number_ = table_.addSection(section_);
+        sectionIsKnown_ = true;
+        return number_;
+    }
+
+    SettingsTable& table_;
+    StoredText section_;
+    bool sectionIsKnown_ = false;
+    std::uint32_t number_ = 0;
+};
+
+void _read(File& file, SettingsTable& table) {
+    FileBytes const& bytes = table.hold(readBytes(file));
+    Loader(table).load(bytes);
+    if (!bytes.whole) throw std::runtime_error("failed to read from file");
+}
+
+} // namespace
+
+InitializationFile::InitializationFile() : table_(new SettingsTable) {}
+
+InitializationFile::InitializationFile(File::Path const& path)
+    : File(static_cast<std::wstring>(path)), table_(new SettingsTable) {}
+
+InitializationFile::~InitializationFile() {
+    quietly([this] { InitializationFile::close(); });
+}
+
+void InitializationFile::open(unsigned long mode) {
+    openAndLoad(
+        *this, mode, [this] { table_->clear(); },
+        [this] {
+            _read(*this, *table_);
+            table_->sort();
+        });
+}
+
+void InitializationFile::close() {
+    writeBackAndClose(
+        *this,
+        [this] {
+            table_->sort();
+            return render(*table_, Headers::OF_SECTIONS);
+        },
+        [this] { table_->clear(); });
+}
+
+std::vector<std::wstring> InitializationFile::enumerateSections() {
+    FileGuard const guard(*this);
+    std::vector<std::wstring> names;
+    Entry const* previous = nullptr;
+    for (Entry const& entry : table_->entries()) {
+        if (previous == nullptr || !table_->sameSection(*previous, entry)) {
+            names.push_back(table_->sectionOf(entry).str());
+        }
+        previous = &entry;
+    }
+    return names;
+}
+
+void InitializationFile::createSection(std::wstring const& section) {
+    FileGuard const guard(*this);
+    bool exists = false;
+    table_->eachOf(section, [&exists](Entry const&) {
+        exists = true;
+        return false;
+    });
+    if (!exists) table_->add(section, _null_wstring, _null_wstring);
+}
+
+void InitializationFile::removeSection(std::wstring const& section) {
+    FileGuard const guard(*this);
+    table_->removeEveryOther(section);
+}
+
+std::vector<std::wstring> InitializationFile::enumerateKeys(std::wstring const& section) {
+    FileGuard const guard(*this);
+    std::vector<std::wstring> keys;
+    table_->eachOf(section, [&keys](Entry const& entry) {
+        keys.push_back(entry.key.str());
+        return true;
+    });
+    return keys;
+}
+
+void InitializationFile::createKey(std::wstring const& section, std::wstring const& key) {
+    FileGuard const guard(*this);
+    if (table_->find(section, key) == SettingsTable::NONE) {
+        table_->add(section, key, _null_wstring);
+    }
+}
+
+void InitializationFile::removeKey(std::wstring const& section, std::wstring const& key) {
+    FileGuard const guard(*this);
+    std::size_t const index = table_->find(section, key);
+    if (index != SettingsTable::NONE) table_->remove(index);
+}
+
+std::wstring InitializationFile::getValue(std::wstring const& section, std::wstring const& key) {
+    FileGuard const guard(*this);
+    std::size_t const index = table_->find(section, key);
+    return index == SettingsTable::NONE ? _null_wstring : table_->entries()[index].value.str();
+}
+
+void InitializationFile::setValue(std::wstring const& section, std::wstring const& key,
+                                  std::wstring const& value) {
+    FileGuard const guard(*this);
+    std::size_t const index = table_->find(section, key);
+    if (index == SettingsTable::NONE)
+        table_->add(section, key, value);
+    else
+        table_->setValue(index, value);
+}
+
+} // namespace Koru

@@ -1,0 +1,192 @@
+#include "settings/settingstable.h"
+
+#include <emmintrin.h>
+
+#include <algorithm>
+#include <new>
+#include <utility>
+
+namespace Koru {
+
+void SettingsTable::clear() {
+    std::vector<Entry>().swap(entries_);
+    std::vector<StoredText>().swap(sections_);
+    bytes_ = FileBytes();
+    strings_.clear();
+    std::vector<std::wstring*>().swap(spare_);
+    std::vector<std::uint16_t>().swap(fingerprints_);
+    std::vector<std::uint32_t>().swap(sectionFingerprints_);
+}
+
+FileBytes const& SettingsTable::hold(FileBytes bytes) {
+    bytes_ = std::move(bytes);
+    return bytes_;
+}
+
+StoredText SettingsTable::keep(std::string_view bytes) {
+    if (isPlain(bytes)) return StoredText(bytes);
+    std::string_view const text = bytes.substr(0, bytes.find('\0'));
+    if (isCanonical(text)) return StoredText(text);
+    std::wstring const decoded = make_wstring(text.data(), text.size());
+    return decoded.empty() ? StoredText() : own(decoded);
+}
+
+std::uint32_t SettingsTable::addSection(StoredText const& name) {
+    sections_.push_back(name);
+    return static_cast<std::uint32_t>(sections_.size() - 1);
+}
+
+void SettingsTable::sort() {
+    auto const before = [this](Entry const& a, Entry const& b) {
+        if (a.section != b.section) {
+            int const order = compare(sectionOf(a), sectionOf(b));
+            if (order != 0) return order < 0;
+        }
+        return compare(a.key, b.key) < 0;
+    };
+    // A file that the library wrote is in order.
+    if (std::is_sorted(entries_.begin(), entries_.end(), before)) return;
+    fingerprints_.clear();
+    // Stays in bounds even where the order is none, as it may be for characters beyond 0x7FFFFFFF.
+    std::stable_sort(entries_.begin(), entries_.end(), before);
+}
+
+std::size_t SettingsTable::find(std::wstring const& section, std::wstring const& key) {
+    completeFingerprints();
+    auto const wanted = static_cast<std::uint16_t>(fingerprint(fingerprint(0, section), key) >> 16);
+    SectionMatcher matches(*this, section);
+    for (std::size_t i = findFingerprint(wanted, 0); i != NONE;
+         i = findFingerprint(wanted, i + 1)) {
+        if (matches(entries_[i]) && compare(entries_[i].key, key) == 0) return i;
+    }
+    return NONE;
+}
+
+void SettingsTable::completeFingerprints() {
+    sectionFingerprints_.reserve(sections_.size());
+    while (sectionFingerprints_.size() < sections_.size()) {
+        sectionFingerprints_.push_back(fingerprint(0, sections_[sectionFingerprints_.size()]));
+    }
+    if (fingerprints_.size() == entries_.size()) return;
+    fingerprints_.reserve(entries_.capacity());
+    while (fingerprints_.size() < entries_.size()) {
+        Entry const& entry = entries_[fingerprints_.size()];
+        std::uint32_t const number = fingerprint(sectionFingerprints_[entry.section], entry.key);
+        fingerprints_.push_back(static_cast<std::uint16_t>(number >> 16));
+    }
+}
+
+std::size_t SettingsTable::findFingerprint(std::uint16_t wanted, std::size_t from) const {
+    std::uint16_t const* const column = fingerprints_.data();
+    std::size_t const size = fingerprints_.size();
+    __m128i const pattern = _mm_set1_epi16(static_cast<short>(wanted));
+    auto const equal = [column, pattern](std::size_t at) {
+        return _mm_cmpeq_epi16(_mm_loadu_si128(reinterpret_cast<__m128i const*>(column + at)),
+                               pattern);
+    };
+    std::size_t i = from;
+    for (; size - i >= 32; i += 32) {
+        __m128i const any = _mm_or_si128(_mm_or_si128(equal(i), equal(i + 8)),
+                                         _mm_or_si128(equal(i + 16), equal(i + 24)));
+        if (_mm_movemask_epi8(any) != 0) break;
+    }
+    auto const* const found = std::find(column + i, column + size, wanted);
+    return found == column + size ? NONE : static_cast<std::size_t>(found - column);
+}
+
+bool SettingsTable::sameSection(Entry const& a, Entry const& b) const {
+    return a.section == b.section || compare(sectionOf(a), sectionOf(b)) == 0;
+}
+
+void SettingsTable::add(std::wstring const& section, std::wstring const& key,
+                        std::wstring const& value) {
+    // What has to be allocated comes first, so that a failure leaves the entries as they are.
+    if (entries_.size() == entries_.capacity()) entries_.reserve(2 * entries_.size() + 8);
+    std::uint32_t const number = sectionFor(section);
+    StoredText const ownKey = own(key);
+    entries_.push_back(Entry{number, ownKey, own(value)});
+}
+
+void SettingsTable::setValue(std::size_t index, std::wstring const& value) {
+    StoredText& stored = entries_[index].value;
+    if (std::wstring* const wide = stored.wide())
+        *wide = value;
+    else
+        stored = own(value);
+}
+
+void SettingsTable::remove(std::size_t index) {
+    auto const offset = static_cast<std::ptrdiff_t>(index);
+    release(entries_[index]);
+    entries_.erase(entries_.begin() + offset);
+    if (index < fingerprints_.size()) fingerprints_.erase(fingerprints_.begin() + offset);
+}
+
+void SettingsTable::removeEveryOther(std::wstring const& section) {
+    SectionMatcher matches(*this, section);
+    std::size_t kept = 0;
+    for (std::size_t i = 0; i < entries_.size(); ++i) {
+        if (matches(entries_[i])) {
+            release(entries_[i]);
+            if (++i == entries_.size()) break;
+        }
+        entries_[kept++] = entries_[i];
+    }
+    if (kept != entries_.size()) fingerprints_.clear();
+    entries_.resize(kept, Entry{});
+}
+
+StoredText SettingsTable::own(std::wstring const& text) {
+    if (spare_.empty()) return StoredText(&strings_.emplace_back(text));
+    *spare_.back() = text;
+    StoredText const owned(spare_.back());
+    spare_.pop_back();
+    return owned;
+}
+
+void SettingsTable::release(StoredText const& text) noexcept {
+    std::wstring* const wide = text.wide();
+    if (wide == nullptr) return;
+    std::wstring().swap(*wide);
+    try {
+        spare_.push_back(wide);
+    } catch (std::bad_alloc const&) { // It is not used again before the table is cleared.
+    }
+}
+
+void SettingsTable::release(Entry const& entry) noexcept {
+    release(entry.key);
+    release(entry.value);
+}
+
+std::uint32_t SettingsTable::sectionFor(std::wstring const& name) {
+    if (!entries_.empty()) {
+        std::uint32_t const last = entries_.back().section;
+        if (sections_[last].str() == name) return last;
+    }
+    if (sections_.size() > 2 * entries_.size() + 64) dropUnusedSections();
+    return addSection(own(name));
+}
+
+/// Keeps the names of sections that come and go from piling up.
+void SettingsTable::dropUnusedSections() {
+    constexpr auto unused = static_cast<std::uint32_t>(-1);
+    std::vector<std::uint32_t> numbers(sections_.size(), unused);
+    std::vector<StoredText> used;
+    used.reserve(entries_.size());
+    for (Entry& entry : entries_) {
+        std::uint32_t& number = numbers[entry.section];
+        if (number == unused) {
+            number = static_cast<std::uint32_t>(used.size());
+            used.push_back(sections_[entry.section]);
+        }
+        entry.section = number;
+    }
+    for (std::size_t i = 0; i < sections_.size(); ++i) {
+        if (numbers[i] == unused) release(sections_[i]);
+    }
+    sections_ = std::move(used);
+    sectionFingerprints_.clear();
+}
+
+} // namespace Koru

@@ -1,0 +1,105 @@
+#include "settings/storedtext.h"
+
+#include <emmintrin.h>
+
+#include <array>
+#include <cstdint>
+#include <cstring>
+
+namespace Koru {
+
+int compare(StoredText const& a, StoredText const& b) {
+    return a.withCursor(
+        [&b](auto x) { return b.withCursor([&x](auto y) { return compareFolded(x, y); }); });
+}
+
+int compare(StoredText const& a, std::wstring const& b) {
+    WideCursor const y(b.c_str());
+    return a.withCursor([&y](auto x) { return compareFolded(x, y); });
+}
+
+namespace {
+
+bool _isPlain16(char const* bytes) {
+    __m128i const block = _mm_loadu_si128(reinterpret_cast<__m128i const*>(bytes));
+    // Signed, the plain bytes are those above zero.
+    return _mm_movemask_epi8(_mm_cmpgt_epi8(block, _mm_setzero_si128())) == 0xFFFF;
+}
+
+} // namespace
+
+bool isPlain(std::string_view bytes) {
+    char const* at = bytes.data();
+    char const* const end = at + bytes.size();
+    if (bytes.size() < 16) {
+        for (; at != end; ++at) {
+            if (static_cast<signed char>(*at) <= 0) return false;
+        }
+        return true;
+    }
+    for (; end - at > 16; at += 16) {
+        if (!_isPlain16(at)) return false;
+    }
+    return _isPlain16(end - 16); // overlaps what was looked at already
+}
+
+bool isCanonical(std::string_view bytes) {
+    static constexpr std::array<wchar_t, 5> leastOfSize = {0, 0x01, 0x80, 0x800, 0x10000};
+    char const* at = bytes.data();
+    char const* const end = at + bytes.size();
+    while (at != end) {
+        Decoded const c = decodeOne(at, static_cast<std::size_t>(end - at));
+        if (c.size > 4 || c.value < leastOfSize[c.size]) return false;
+        // A `?` that does not stand there was cut short by the end.
+        if (c.size == 1 && c.value != *at) return false;
+        for (std::size_t i = 1; i < c.size; ++i) {
+            if ((at[i] & 0xC0) != 0x80) return false;
+        }
+        at += c.size;
+    }
+    return true;
+}
+
+namespace {
+
+/// What a character counts as. Two characters that some locale pairs count as the same: the letters
+/// of ASCII as their lower case, but for those that are paired with characters beyond ASCII (I and
+/// i with the Turkish dotted and dotless i, K with the Kelvin sign), which count as one with all
+/// that is beyond ASCII.
+constexpr std::uint32_t _class(std::uint32_t c) {
+    constexpr std::uint32_t disputed = 0x80;
+    if (c >= 0x80 || c == 'I' || c == 'i' || c == 'K' || c == 'k') return disputed;
+    return c >= 'A' && c <= 'Z' ? c + ('a' - 'A') : c;
+}
+
+constexpr std::array<std::uint8_t, 128> _makeClasses() {
+    std::array<std::uint8_t, 128> classes{};
+    for (std::uint32_t c = 0; c < classes.size(); ++c) {
+        classes[c] = static_cast<std::uint8_t>(_class(c));
+    }
+    return classes;
+}
+
+constexpr std::array<std::uint8_t, 128> CLASSES = _makeClasses();
+
+template <class Cursor>
+std::uint32_t _fingerprint(std::uint32_t before, Cursor cursor) {
+    std::uint32_t result = before;
+    while (wchar_t const c = cursor.next()) {
+        auto const value = static_cast<std::uint32_t>(c);
+        result = (result ^ (value < 0x80 ? CLASSES[value] : 0x80U)) * 0x01000193U; // FNV-1a
+    }
+    return result * 0x9E3779B1U; // spreads to the high bits and sets the next text apart
+}
+
+} // namespace
+
+std::uint32_t fingerprint(std::uint32_t before, StoredText const& text) {
+    return text.withCursor([before](auto cursor) { return _fingerprint(before, cursor); });
+}
+
+std::uint32_t fingerprint(std::uint32_t before, std::wstring const& text) {
+    return _fingerprint(before, WideCursor(text.c_str()));
+}
+
+} // namespace Koru

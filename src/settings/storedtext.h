@@ -1,0 +1,99 @@
+// How a settings table keeps its text.
+//
+// Opening a file makes three strings of every line, and most programs look at few of them. So text
+// from a file stays where it was read, as bytes, and is widened when somebody asks for it. That
+// works for text whose bytes are just what make_string gives for its characters; other text, and
+// what callers set, is kept as a wide string.
+#ifndef KORU_SETTINGS_STOREDTEXT_H
+#define KORU_SETTINGS_STOREDTEXT_H
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+#include "text/convert.h"
+#include "text/fold.h"
+
+namespace Koru {
+
+/// A view of text that somebody else holds: bytes or a wide string. Empty by default.
+class StoredText {
+public:
+    StoredText() : bytes_(""), size_(0) {}
+
+    /// Bytes for which `isPlain` or `isCanonical` holds.
+    explicit StoredText(std::string_view bytes) : bytes_(bytes.data()), size_(bytes.size()) {}
+
+    /// A wide string of any content.
+    explicit StoredText(std::wstring* wide) : wide_(wide), size_(WIDE) {}
+
+    bool empty() const { return size_ == WIDE ? wide_->empty() : size_ == 0; }
+
+    /// The wide string, or null where the text is bytes.
+    std::wstring* wide() const { return size_ == WIDE ? wide_ : nullptr; }
+
+    /// The bytes of a text that is not wide.
+    std::string_view bytes() const { return std::string_view(bytes_, size_); }
+
+    /// The text as a string, all characters of a wide one included.
+    std::wstring str() const { return size_ == WIDE ? *wide_ : make_wstring(bytes_, size_); }
+
+    /// Calls `use` with a cursor over the characters.
+    template <class Use>
+    auto withCursor(Use use) const;
+
+private:
+    static constexpr std::size_t WIDE = static_cast<std::size_t>(-1);
+
+    union {
+        char const* bytes_;
+        std::wstring* wide_;
+    };
+    std::size_t size_; // or WIDE
+};
+
+/// A cursor over the characters of bytes.
+class BytesCursor {
+public:
+    explicit BytesCursor(std::string_view bytes)
+        : at_(bytes.data()), end_(bytes.data() + bytes.size()) {}
+
+    wchar_t next() {
+        if (at_ == end_) return 0;
+        if (static_cast<signed char>(*at_) >= 0) return *at_++;
+        Decoded const c = decodeOne(at_, static_cast<std::size_t>(end_ - at_));
+        at_ += c.size;
+        return c.value;
+    }
+
+private:
+    char const* at_;
+    char const* end_;
+};
+
+template <class Use>
+auto StoredText::withCursor(Use use) const {
+    if (size_ == WIDE) return use(WideCursor(wide_->c_str()));
+    return use(BytesCursor(bytes()));
+}
+
+/// Compares as `compare` does with the wide strings.
+int compare(StoredText const& a, StoredText const& b);
+int compare(StoredText const& a, std::wstring const& b);
+
+/// Whether the bytes are ASCII without a NUL.
+bool isPlain(std::string_view bytes);
+
+/// Whether make_string gives these bytes for what make_wstring makes of them. May be false for
+/// characters beyond four bytes, of which no text consists.
+bool isCanonical(std::string_view bytes);
+
+/// A number from all characters before the first NUL that continues the one of the text before it.
+/// Equal for any two texts that compare equal, under whatever locale: see the source.
+std::uint32_t fingerprint(std::uint32_t before, StoredText const& text);
+std::uint32_t fingerprint(std::uint32_t before, std::wstring const& text);
+
+} // namespace Koru
+
+#endif

@@ -1,0 +1,84 @@
+// Child processes: for what ends, prints, limits or replaces a process.
+#ifndef KORU_TESTS_SUBPROCESS_H
+#define KORU_TESTS_SUBPROCESS_H
+
+#include <fcntl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+namespace test {
+
+struct Outcome {
+    int exitCode = -1; ///< -1 when a signal ended the process
+    int signal = 0;    ///< 0 when it exited
+    std::string out;   ///< what it wrote to standard output
+};
+
+/// Forks, runs the callable in the child with its standard output captured, and ends the child with
+/// the callable's int result by `_exit` (so neither static destructors nor doctest run there).
+/// An exception out of the callable gives exit code 124.
+template <class Callable>
+Outcome inChild(Callable callable) {
+    int ends[2];
+    if (::pipe(ends) != 0) throw std::runtime_error("pipe failed");
+    std::fflush(nullptr);
+    pid_t const child = ::fork();
+    if (child < 0) throw std::runtime_error("fork failed");
+    if (child == 0) {
+        ::dup2(ends[1], STDOUT_FILENO);
+        ::close(ends[0]);
+        ::close(ends[1]);
+        int code = 124;
+        try {
+            code = callable();
+        } catch (...) {
+        }
+        std::fflush(nullptr);
+        ::_exit(code);
+    }
+    ::close(ends[1]);
+    Outcome outcome;
+    char block[4096];
+    for (;;) {
+        ssize_t const n = ::read(ends[0], block, sizeof block);
+        if (n <= 0) break;
+        outcome.out.append(block, static_cast<std::size_t>(n));
+    }
+    ::close(ends[0]);
+    int status = 0;
+    if (::waitpid(child, &status, 0) != child) throw std::runtime_error("waitpid failed");
+    if (WIFEXITED(status)) outcome.exitCode = WEXITSTATUS(status);
+    if (WIFSIGNALED(status)) outcome.signal = WTERMSIG(status);
+    return outcome;
+}
+
+/// Runs a program by exec. `arguments` begins with argv[0], which may differ from `program`; the
+/// child changes to `directory` first, unless that is empty.
+inline Outcome execute(std::string const& program, std::vector<std::string> arguments,
+                       std::string const& directory = "") {
+    return inChild([&] {
+        if (!directory.empty() && ::chdir(directory.c_str()) != 0) return 126;
+        std::vector<char*> argv;
+        for (std::string& argument : arguments) argv.push_back(&argument[0]);
+        argv.push_back(nullptr);
+        ::execv(program.c_str(), argv.data());
+        return 127;
+    });
+}
+
+/// The running executable's file, however the process was started.
+inline std::string ownExecutable() {
+    char buffer[4096] = {};
+    ssize_t const n = ::readlink("/proc/self/exe", buffer, sizeof buffer - 1);
+    if (n <= 0) throw std::runtime_error("readlink failed");
+    return std::string(buffer, static_cast<std::size_t>(n));
+}
+
+} // namespace test
+
+#endif

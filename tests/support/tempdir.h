@@ -1,0 +1,59 @@
+// A temporary directory of a test's own, and reading and writing whole files in it.
+#ifndef KORU_TESTS_TEMPDIR_H
+#define KORU_TESTS_TEMPDIR_H
+
+#include <stdlib.h>
+
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+#include <string>
+
+namespace test {
+
+/// Made on construction, removed with its content on destruction.
+class TempDir {
+public:
+    TempDir() {
+        std::string name = std::filesystem::temp_directory_path().string() + "/koru-test-XXXXXX";
+        if (::mkdtemp(&name[0]) == nullptr) throw std::runtime_error("mkdtemp failed");
+        path_ = std::filesystem::canonical(name).string();
+    }
+    TempDir(TempDir const&) = delete;
+    TempDir& operator=(TempDir const&) = delete;
+    ~TempDir() {
+        std::error_code ignored;
+        std::filesystem::remove_all(path_, ignored);
+    }
+
+    /// The directory, without a slash at its end.
+    std::string const& path() const { return path_; }
+    /// The path of an entry below it.
+    std::string operator/(std::string const& name) const { return path_ + "/" + name; }
+    /// The same as a wide string. For ASCII names, which the directory's own is.
+    std::wstring wide(std::string const& name) const {
+        std::string const narrow = *this / name;
+        return std::wstring(narrow.begin(), narrow.end());
+    }
+
+private:
+    std::string path_;
+};
+
+inline void writeFile(std::string const& path, std::string const& bytes) {
+    std::ofstream out(path, std::ios::binary | std::ios::trunc);
+    out.write(bytes.data(), static_cast<std::streamsize>(bytes.size()));
+    out.close();
+    if (!out) throw std::runtime_error("cannot write " + path);
+}
+
+inline std::string readFile(std::string const& path) {
+    std::ifstream in(path, std::ios::binary);
+    if (!in) throw std::runtime_error("cannot read " + path);
+    return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+}
+
+} // namespace test
+
+#endif
