@@ -33,6 +33,7 @@ public:
     explicit Loader(SettingsTable& table) : table_(table) {}
 
     void load(FileBytes const& bytes) {
+        table_.expect(bytes.size / USUAL_LINE);
         eachLine(bytes, [this](std::string_view line) { _parse(trim(line)); });
     }
 
@@ -46,10 +47,11 @@ private:
         }
         std::size_t const equals = line.find('=');
         if (equals == std::string_view::npos) return;
-        StoredText const key = table_.keep(line.substr(0, equals));
+        bool const plain = isPlain(line);
+        StoredText const key = table_.keep(line.substr(0, equals), plain);
         if (key.empty() || section_.empty()) return;
         // Neither is trimmed: blanks around "=" belong to key and value.
-        table_.append(Entry{_sectionNumber(), key, table_.keep(line.substr(equals + 1))});
+        table_.append(Entry{_sectionNumber(), key, table_.keep(line.substr(equals + 1), plain)});
     }
 
     /// The table learns a section's name with its first entry, for it exists only with entries.
@@ -58,6 +60,8 @@ private:
         sectionIsKnown_ = true;
         return number_;
     }
+
+    static constexpr std::size_t USUAL_LINE = 32; // bytes, to guess the number of entries from
 
     SettingsTable& table_;
     StoredText section_;

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <new>
+#include <numeric>
 #include <utility>
 
 namespace Koru {
@@ -37,18 +38,39 @@ std::uint32_t SettingsTable::addSection(StoredText const& name) {
 }
 
 void SettingsTable::sort() {
-    auto const before = [this](Entry const& a, Entry const& b) {
-        if (a.section != b.section) {
-            int const order = compare(sectionOf(a), sectionOf(b));
-            if (order != 0) return order < 0;
-        }
-        return compare(a.key, b.key) < 0;
+    auto const byName = [this](Entry const& a, Entry const& b) {
+        if (a.section == b.section) return compare(a.key, b.key) < 0;
+        int const order = compare(sectionOf(a), sectionOf(b));
+        return order < 0 || (order == 0 && compare(a.key, b.key) < 0);
     };
     // A file that the library wrote is in order.
-    if (std::is_sorted(entries_.begin(), entries_.end(), before)) return;
+    if (std::is_sorted(entries_.begin(), entries_.end(), byName)) return;
     fingerprints_.clear();
-    // Stays in bounds even where the order is none, as it may be for characters beyond 0x7FFFFFFF.
-    std::stable_sort(entries_.begin(), entries_.end(), before);
+    std::vector<std::uint32_t> const ranks = sectionRanks();
+    auto const byRank = [&ranks](Entry const& a, Entry const& b) {
+        std::uint32_t const rankA = ranks[a.section];
+        std::uint32_t const rankB = ranks[b.section];
+        return rankA < rankB || (rankA == rankB && compare(a.key, b.key) < 0);
+    };
+    // Stays in bounds even where names have no consistent order, as with characters beyond
+    // 0x7FFFFFFF.
+    std::stable_sort(entries_.begin(), entries_.end(), byRank);
+}
+
+/// The place of each section's name in the order of all names; equal names have the same.
+std::vector<std::uint32_t> SettingsTable::sectionRanks() const {
+    std::vector<std::uint32_t> order(sections_.size());
+    std::iota(order.begin(), order.end(), 0U);
+    std::stable_sort(order.begin(), order.end(), [this](std::uint32_t a, std::uint32_t b) {
+        return compare(sections_[a], sections_[b]) < 0;
+    });
+    std::vector<std::uint32_t> ranks(sections_.size());
+    std::uint32_t rank = 0;
+    for (std::size_t i = 1; i < order.size(); ++i) {
+        if (compare(sections_[order[i - 1]], sections_[order[i]]) != 0) ++rank;
+        ranks[order[i]] = rank;
+    }
+    return ranks;
 }
 
 std::size_t SettingsTable::find(std::wstring const& section, std::wstring const& key) {

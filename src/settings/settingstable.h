@@ -42,9 +42,17 @@ public:
     /// Takes the bytes that the texts of the entries to come are views of. The table is empty.
     FileBytes const& hold(FileBytes bytes);
 
+    /// Makes room for about as many entries.
+    void expect(std::size_t count) { entries_.reserve(count); }
+
     /// A text of the held bytes as make_wstring converts it: it ends at its first NUL, and what is
     /// not well-formed is kept as the characters that it decodes to.
     StoredText keep(std::string_view bytes);
+
+    /// The same for a part of a line that is known to be plain, or not.
+    StoredText keep(std::string_view bytes, bool plain) {
+        return plain ? StoredText(bytes) : keep(bytes);
+    }
 
     /// Makes a section name known and returns its number for `Entry`.
     std::uint32_t addSection(StoredText const& name);
@@ -86,6 +94,7 @@ private:
     void release(Entry const& entry) noexcept;
     std::uint32_t sectionFor(std::wstring const& name);
     void dropUnusedSections();
+    std::vector<std::uint32_t> sectionRanks() const;
     void completeFingerprints();
     std::size_t findFingerprint(std::uint16_t wanted, std::size_t from) const;
 

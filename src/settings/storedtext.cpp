@@ -2,13 +2,42 @@
 
 #include <emmintrin.h>
 
+#include <algorithm>
 #include <array>
 #include <cstdint>
 #include <cstring>
 
 namespace Koru {
 
+namespace {
+
+/// How many bytes two texts have in common at their start, in whole characters.
+std::size_t _commonPrefix(std::string_view a, std::string_view b) {
+    std::size_t const most = std::min(a.size(), b.size());
+    std::size_t i = 0;
+    for (; most - i >= sizeof(std::uint32_t); i += sizeof(std::uint32_t)) {
+        std::uint32_t x;
+        std::uint32_t y;
+        std::memcpy(&x, a.data() + i, sizeof x);
+        std::memcpy(&y, b.data() + i, sizeof y);
+        if (x != y) break;
+    }
+    while (i != most && a[i] == b[i]) ++i;
+    auto const startsInside = [&i](std::string_view text) {
+        return i != text.size() && (text[i] & 0xC0) == 0x80;
+    };
+    while (i != 0 && (startsInside(a) || startsInside(b))) --i;
+    return i;
+}
+
+} // namespace
+
 int compare(StoredText const& a, StoredText const& b) {
+    if (a.wide() == nullptr && b.wide() == nullptr) {
+        std::size_t const common = _commonPrefix(a.bytes(), b.bytes());
+        return compareFolded(BytesCursor(a.bytes().substr(common)),
+                             BytesCursor(b.bytes().substr(common)));
+    }
     return a.withCursor(
         [&b](auto x) { return b.withCursor([&x](auto y) { return compareFolded(x, y); }); });
 }
