@@ -56,7 +56,11 @@ public:
     /// was and the stream's fail state is set.
     /// @throws std::runtime_error "failed to open file."; it is closed then, the mode unchanged.
     ///         Also for a mode with neither `READ` nor `WRITE`.
+    // LogFile hides this operation on purpose; GCC reports that here, Clang there.
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Woverloaded-virtual"
     virtual void open(unsigned long mode);
+#pragma GCC diagnostic pop
 
     /// Writes out what is buffered, closes the file and resets the mode to 0. Where writing out
     /// fails, the stream's fail state is set; likewise on a file that is not open.

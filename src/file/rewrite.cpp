@@ -16,33 +16,47 @@ namespace Koru {
 
 namespace {
 
+/// Writes a block and tells whether all of it was taken.
+bool _write(int descriptor, std::string_view block) {
+    while (!block.empty()) {
+        ssize_t const n = ::write(descriptor, block.data(), block.size());
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) return false;
+        block.remove_prefix(static_cast<std::size_t>(n));
+    }
+    return true;
+}
+
 /// Writes the content without a stream, as far as the system takes it.
-void _save(std::string const& name, Content const& content) {
+void _save(std::string const& name, Content& content) {
     int const descriptor = ::open(name.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
     if (descriptor < 0) return;
-    std::size_t written = 0;
-    while (written < content.size) {
-        ssize_t const n = ::write(descriptor, content.data.get() + written, content.size - written);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) break;
-        written += static_cast<std::size_t>(n);
+    for (std::string_view block = content.next(); !block.empty(); block = content.next()) {
+        if (!_write(descriptor, block)) break;
     }
     ::close(descriptor);
 }
 
-void _write(File& file, Content const& content) {
+void _check(File const& file) {
+    if (file.fail()) throw std::runtime_error("failed to write to file");
+}
+
+void _write(File& file, Content& content) {
     file.flush();
     file.clear();
-    // One unformatted write: `<<` would find the inserter that counts with 8 bits.
-    file.write(content.data.get(), static_cast<std::streamsize>(content.size));
+    // Unformatted: `<<` would find the inserter that counts with 8 bits.
+    for (std::string_view block = content.next(); !block.empty(); block = content.next()) {
+        file.write(block.data(), static_cast<std::streamsize>(block.size()));
+        _check(file);
+    }
     // What stays in the stream's buffer has not met a full disk yet.
     file.flush();
-    if (file.fail()) throw std::runtime_error("failed to write to file");
+    _check(file);
 }
 
 } // namespace
 
-void rewrite(File& file, Content const& content) {
+void rewrite(File& file, Content& content) {
     // A cancelled thread ends before or after this, but not between the old file and the new one.
     CancellationOff const guard;
     unsigned long const mode = file.getMode();

@@ -2,8 +2,7 @@
 #ifndef KORU_FILE_REWRITE_H
 #define KORU_FILE_REWRITE_H
 
-#include <cstddef>
-#include <memory>
+#include <string_view>
 
 #include <koru/file.h>
 
@@ -11,10 +10,14 @@
 
 namespace Koru {
 
-/// Bytes that are ready to be written.
-struct Content {
-    std::unique_ptr<char[]> data;
-    std::size_t size = 0;
+/// The new content of a file, given block by block. All memory that giving it takes is there before
+/// the old file is touched.
+class Content {
+public:
+    virtual ~Content() = default;
+
+    /// The next block, valid until the next call; empty at the end.
+    virtual std::string_view next() = 0;
 };
 
 /// Opens the file, discards what was held in memory and loads the file if the mode says so.
@@ -28,15 +31,18 @@ void openAndLoad(File& file, unsigned long mode, Discard discard, Load load) {
 
 /// Deletes the file and writes it anew with the mode of now; it is open afterwards.
 /// @throws std::runtime_error "failed to write to file", and what File::open and close throw
-void rewrite(File& file, Content const& content);
+void rewrite(File& file, Content& content);
 
 /// Writes the file anew if the mode says so, then discards what was held in memory and closes.
-/// `prepare` gives the whole content before the old file is touched: what fails for want of memory
-/// fails while the old file is still there.
+/// `prepare` gives the content, ready to be written, before the old file is touched: what fails for
+/// want of memory fails while the old file is still there.
 template <class Prepare, class Discard>
 void writeBackAndClose(File& file, Prepare prepare, Discard discard) {
     FileGuard const guard(file);
-    if ((file.getMode() & File::WRITE) != 0) rewrite(file, prepare());
+    if ((file.getMode() & File::WRITE) != 0) {
+        auto content = prepare();
+        rewrite(file, content);
+    }
     discard();
     file.File::close();
 }

@@ -1,12 +1,12 @@
 #include <koru/initializationfile.h>
 
-#include <stdexcept>
+#include <string_view>
 
 #include <koru/string.h>
 
 #include "file/quiet.h"
 #include "file/rewrite.h"
-#include "settings/lines.h"
+#include "settings/load.h"
 #include "settings/render.h"
 #include "settings/settingstable.h"
 
@@ -27,41 +27,33 @@ std::string_view _sectionName(std::string_view line) {
     return name == std::string_view::npos ? opened : opened.substr(name);
 }
 
-/// Loads lines into a table, section by section.
-class Loader {
+/// Adds the entries of one line after the other to a table, each to the section of the last header.
+class Parser {
 public:
-    explicit Loader(SettingsTable& table) : table_(table) {}
+    explicit Parser(SettingsTable& table) : table_(table) {}
 
-    void load(FileBytes const& bytes) {
-        table_.expect(bytes.size / USUAL_LINE);
-        eachLine(bytes, [this](std::string_view line) { _parse(trim(line)); });
-    }
-
-private:
-    void _parse(std::string_view line) {
-        if (isComment(line)) return;
+    void parse(std::string_view line, bool plain) {
         if (line.front() == '[') {
-            section_ = table_.keep(_sectionName(line));
+            section_ = table_.keep(_sectionName(line), plain);
             sectionIsKnown_ = false;
             return;
         }
         std::size_t const equals = line.find('=');
         if (equals == std::string_view::npos) return;
-        bool const plain = isPlain(line);
         StoredText const key = table_.keep(line.substr(0, equals), plain);
         if (key.empty() || section_.empty()) return;
         // Neither is trimmed: blanks around "=" belong to key and value.
-        table_.append(Entry{_sectionNumber(), key, table_.keep(line.substr(equals + 1), plain)});
+        StoredText const value = table_.keep(line.substr(equals + 1), plain);
+        table_.append(sectionNumber(), key, value);
     }
 
+private:
     /// The table learns a section's name with its first entry, for it exists only with entries.
-    std::uint32_t _sectionNumber() {
+    std::uint32_t sectionNumber() {
         if (!sectionIsKnown_) number_ = table_.addSection(section_);
         sectionIsKnown_ = true;
         return number_;
     }
-
-    static constexpr std::size_t USUAL_LINE = 32; // bytes, to guess the number of entries from
 
     SettingsTable& table_;
     StoredText section_;
@@ -70,9 +62,9 @@ private:
 };
 
 void _read(File& file, SettingsTable& table) {
-    FileBytes const& bytes = table.hold(readBytes(file));
-    Loader(table).load(bytes);
-    if (!bytes.whole) throw std::runtime_error("failed to read from file");
+    Parser parser(table);
+    loadLines(file, table,
+              [&parser](std::string_view line, bool plain) { parser.parse(line, plain); });
 }
 
 } // namespace
@@ -145,31 +137,23 @@ std::vector<std::wstring> InitializationFile::enumerateKeys(std::wstring const& 
 
 void InitializationFile::createKey(std::wstring const& section, std::wstring const& key) {
     FileGuard const guard(*this);
-    if (table_->find(section, key) == SettingsTable::NONE) {
-        table_->add(section, key, _null_wstring);
-    }
+    table_->create(section, key);
 }
 
 void InitializationFile::removeKey(std::wstring const& section, std::wstring const& key) {
     FileGuard const guard(*this);
-    std::size_t const index = table_->find(section, key);
-    if (index != SettingsTable::NONE) table_->remove(index);
+    table_->remove(section, key);
 }
 
 std::wstring InitializationFile::getValue(std::wstring const& section, std::wstring const& key) {
     FileGuard const guard(*this);
-    std::size_t const index = table_->find(section, key);
-    return index == SettingsTable::NONE ? _null_wstring : table_->entries()[index].value.str();
+    return table_->getValue(section, key);
 }
 
 void InitializationFile::setValue(std::wstring const& section, std::wstring const& key,
                                   std::wstring const& value) {
     FileGuard const guard(*this);
-    std::size_t const index = table_->find(section, key);
-    if (index == SettingsTable::NONE)
-        table_->add(section, key, value);
-    else
-        table_->setValue(index, value);
+    table_->setValue(section, key, value);
 }
 
 } // namespace Koru

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "file/rewind.h"
+
 namespace Koru {
 
 namespace {
@@ -28,8 +30,7 @@ void _grow(FileBytes& bytes, std::size_t capacity) {
 } // namespace
 
 FileBytes readBytes(File& file) {
-    file.flush();
-    file.clear();
+    rewind(file);
     std::size_t const hint = _sizeHint(file);
     std::size_t capacity = std::clamp<std::size_t>(hint, 1, FIRST_CAPACITY_MOST);
     FileBytes bytes;
@@ -46,16 +47,6 @@ FileBytes readBytes(File& file) {
     }
     bytes.whole = !file.bad();
     return bytes;
-}
-
-std::string_view trim(std::string_view line) {
-    auto const isText = [](char c) { return c != ' ' && c != '\t'; };
-    std::size_t last = line.size();
-    while (last != 0 && !isText(line[last - 1])) --last;
-    if (last == 0) return line;
-    std::size_t first = 0;
-    while (!isText(line[first])) ++first;
-    return line.substr(first, last - first);
 }
 
 } // namespace Koru

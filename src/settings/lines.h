@@ -41,7 +41,15 @@ void eachLine(FileBytes const& bytes, Use use) {
 }
 
 /// The line without the tabs and blanks at both ends. A line of nothing else stays as it is.
-std::string_view trim(std::string_view line);
+inline std::string_view trim(std::string_view line) {
+    auto const isText = [](char c) { return c != ' ' && c != '\t'; };
+    std::size_t last = line.size();
+    while (last != 0 && !isText(line[last - 1])) --last;
+    if (last == 0) return line;
+    std::size_t first = 0;
+    while (!isText(line[first])) ++first;
+    return std::string_view(line.data() + first, last - first);
+}
 
 /// Whether a trimmed line is a comment.
 inline bool isComment(std::string_view line) {

@@ -69,15 +69,14 @@ void _emit(SettingsTable const& table, Headers headers, Sink& sink) {
 
 } // namespace
 
-Content render(SettingsTable const& table, Headers headers) {
+RenderedText render(SettingsTable const& table, Headers headers) {
     Counter counter;
     _emit(table, headers, counter);
-    Content content;
-    content.data.reset(new char[counter.size()]);
-    Writer writer(content.data.get());
+    std::unique_ptr<char[]> bytes(new char[counter.size()]);
+    Writer writer(bytes.get());
     _emit(table, headers, writer);
-    content.size = static_cast<std::size_t>(writer.end() - content.data.get());
-    return content;
+    auto const size = static_cast<std::size_t>(writer.end() - bytes.get());
+    return RenderedText(std::move(bytes), size);
 }
 
 } // namespace Koru

@@ -2,6 +2,11 @@
 #ifndef KORU_SETTINGS_RENDER_H
 #define KORU_SETTINGS_RENDER_H
 
+#include <cstddef>
+#include <memory>
+#include <string_view>
+#include <utility>
+
 #include "file/rewrite.h"
 #include "settings/settingstable.h"
 
@@ -13,7 +18,22 @@ enum class Headers {
     OF_SECTIONS ///< before the first entry of each run in one section: "[", its name and "]"
 };
 
-Content render(SettingsTable const& table, Headers headers);
+/// The whole file as one block.
+class RenderedText : public Content {
+public:
+    RenderedText(std::unique_ptr<char[]> bytes, std::size_t size)
+        : bytes_(std::move(bytes)), left_(size) {}
+
+    std::string_view next() override {
+        return std::string_view(bytes_.get(), std::exchange(left_, 0));
+    }
+
+private:
+    std::unique_ptr<char[]> bytes_;
+    std::size_t left_;
+};
+
+RenderedText render(SettingsTable const& table, Headers headers);
 
 } // namespace Koru
 

@@ -1,7 +1,5 @@
 #include "settings/settingstable.h"
 
-#include <emmintrin.h>
-
 #include <algorithm>
 #include <new>
 #include <numeric>
@@ -15,7 +13,7 @@ void SettingsTable::clear() {
     bytes_ = FileBytes();
     strings_.clear();
     std::vector<std::wstring*>().swap(spare_);
-    std::vector<std::uint16_t>().swap(fingerprints_);
+    std::vector<Fingerprint>().swap(fingerprints_);
     std::vector<std::uint32_t>().swap(sectionFingerprints_);
 }
 
@@ -75,13 +73,15 @@ std::vector<std::uint32_t> SettingsTable::sectionRanks() const {
 
 std::size_t SettingsTable::find(std::wstring const& section, std::wstring const& key) {
     completeFingerprints();
-    auto const wanted = static_cast<std::uint16_t>(fingerprint(fingerprint(0, section), key) >> 16);
+    Fingerprint const wanted = toFingerprint(fingerprint(fingerprint(0, section), key));
+    auto const next = [this, wanted](std::size_t from) {
+        return findFingerprint(fingerprints_, wanted, from);
+    };
     SectionMatcher matches(*this, section);
-    for (std::size_t i = findFingerprint(wanted, 0); i != NONE;
-         i = findFingerprint(wanted, i + 1)) {
+    for (std::size_t i = next(0); i != NOT_FOUND; i = next(i + 1)) {
         if (matches(entries_[i]) && compare(entries_[i].key, key) == 0) return i;
     }
-    return NONE;
+    return NOT_FOUND;
 }
 
 void SettingsTable::completeFingerprints() {
@@ -93,27 +93,9 @@ void SettingsTable::completeFingerprints() {
     fingerprints_.reserve(entries_.capacity());
     while (fingerprints_.size() < entries_.size()) {
         Entry const& entry = entries_[fingerprints_.size()];
-        std::uint32_t const number = fingerprint(sectionFingerprints_[entry.section], entry.key);
-        fingerprints_.push_back(static_cast<std::uint16_t>(number >> 16));
+        fingerprints_.push_back(
+            toFingerprint(fingerprint(sectionFingerprints_[entry.section], entry.key)));
     }
-}
-
-std::size_t SettingsTable::findFingerprint(std::uint16_t wanted, std::size_t from) const {
-    std::uint16_t const* const column = fingerprints_.data();
-    std::size_t const size = fingerprints_.size();
-    __m128i const pattern = _mm_set1_epi16(static_cast<short>(wanted));
-    auto const equal = [column, pattern](std::size_t at) {
-        return _mm_cmpeq_epi16(_mm_loadu_si128(reinterpret_cast<__m128i const*>(column + at)),
-                               pattern);
-    };
-    std::size_t i = from;
-    for (; size - i >= 32; i += 32) {
-        __m128i const any = _mm_or_si128(_mm_or_si128(equal(i), equal(i + 8)),
-                                         _mm_or_si128(equal(i + 16), equal(i + 24)));
-        if (_mm_movemask_epi8(any) != 0) break;
-    }
-    auto const* const found = std::find(column + i, column + size, wanted);
-    return found == column + size ? NONE : static_cast<std::size_t>(found - column);
 }
 
 bool SettingsTable::sameSection(Entry const& a, Entry const& b) const {
@@ -126,10 +108,25 @@ void SettingsTable::add(std::wstring const& section, std::wstring const& key,
     if (entries_.size() == entries_.capacity()) entries_.reserve(2 * entries_.size() + 8);
     std::uint32_t const number = sectionFor(section);
     StoredText const ownKey = own(key);
-    entries_.push_back(Entry{number, ownKey, own(value)});
+    entries_.emplace_back(number, ownKey, own(value));
 }
 
-void SettingsTable::setValue(std::size_t index, std::wstring const& value) {
+void SettingsTable::create(std::wstring const& section, std::wstring const& key) {
+    if (find(section, key) == NOT_FOUND) add(section, key, std::wstring());
+}
+
+std::wstring SettingsTable::getValue(std::wstring const& section, std::wstring const& key) {
+    std::size_t const index = find(section, key);
+    return index == NOT_FOUND ? std::wstring() : entries_[index].value.str();
+}
+
+void SettingsTable::setValue(std::wstring const& section, std::wstring const& key,
+                             std::wstring const& value) {
+    std::size_t const index = find(section, key);
+    if (index == NOT_FOUND) {
+        add(section, key, value);
+        return;
+    }
     StoredText& stored = entries_[index].value;
     if (std::wstring* const wide = stored.wide())
         *wide = value;
@@ -137,11 +134,13 @@ void SettingsTable::setValue(std::size_t index, std::wstring const& value) {
         stored = own(value);
 }
 
-void SettingsTable::remove(std::size_t index) {
+void SettingsTable::remove(std::wstring const& section, std::wstring const& key) {
+    std::size_t const index = find(section, key);
+    if (index == NOT_FOUND) return;
     auto const offset = static_cast<std::ptrdiff_t>(index);
     release(entries_[index]);
     entries_.erase(entries_.begin() + offset);
-    if (index < fingerprints_.size()) fingerprints_.erase(fingerprints_.begin() + offset);
+    fingerprints_.erase(fingerprints_.begin() + offset); // complete after find
 }
 
 void SettingsTable::removeEveryOther(std::wstring const& section) {
@@ -155,7 +154,7 @@ void SettingsTable::removeEveryOther(std::wstring const& section) {
         entries_[kept++] = entries_[i];
     }
     if (kept != entries_.size()) fingerprints_.clear();
-    entries_.resize(kept, Entry{});
+    entries_.erase(entries_.begin() + static_cast<std::ptrdiff_t>(kept), entries_.end());
 }
 
 StoredText SettingsTable::own(std::wstring const& text) {

@@ -17,14 +17,16 @@
 
 #include "settings/lines.h"
 #include "settings/storedtext.h"
+#include "text/fingerprint.h"
 
 namespace Koru {
 
 class SettingsTable {
 public:
-    static constexpr std::size_t NONE = static_cast<std::size_t>(-1);
-
     struct Entry {
+        Entry(std::uint32_t s, StoredText const& k, StoredText const& v)
+            : section(s), key(k), value(v) {}
+
         std::uint32_t section; ///< which of the section names
         StoredText key;
         StoredText value;
@@ -57,15 +59,30 @@ public:
     /// Makes a section name known and returns its number for `Entry`.
     std::uint32_t addSection(StoredText const& name);
 
-    void append(Entry const& entry) { entries_.push_back(entry); }
+    void append(std::uint32_t section, StoredText const& key, StoredText const& value) {
+        entries_.emplace_back(section, key, value);
+    }
 
     /// @}
 
     /// Sorts by section, then by key; equal entries keep their order.
     void sort();
 
-    /// The first entry with this section and key, or NONE.
-    std::size_t find(std::wstring const& section, std::wstring const& key);
+    /// @name Operations on the first entry with this section and key
+    /// @{
+
+    /// Adds an entry with an empty value at the end, unless there is one.
+    void create(std::wstring const& section, std::wstring const& key);
+
+    /// Its value; empty when there is none.
+    std::wstring getValue(std::wstring const& section, std::wstring const& key);
+
+    /// Replaces its value, or adds an entry at the end.
+    void setValue(std::wstring const& section, std::wstring const& key, std::wstring const& value);
+
+    void remove(std::wstring const& section, std::wstring const& key);
+
+    /// @}
 
     /// Whether two entries stand in sections of equal names.
     bool sameSection(Entry const& a, Entry const& b) const;
@@ -77,10 +94,6 @@ public:
     /// Adds an entry at the end.
     void add(std::wstring const& section, std::wstring const& key, std::wstring const& value);
 
-    void setValue(std::size_t index, std::wstring const& value);
-
-    void remove(std::size_t index);
-
     /// Intended: looks at each entry in turn and removes it if it stands in the section, but never
     /// looks at the one behind a removed entry, which has moved into its place.
     void removeEveryOther(std::wstring const& section);
@@ -89,6 +102,7 @@ private:
     /// Tells whether an entry stands in a section, comparing once for each run of entries.
     class SectionMatcher;
 
+    std::size_t find(std::wstring const& section, std::wstring const& key);
     StoredText own(std::wstring const& text);
     void release(StoredText const& text) noexcept;
     void release(Entry const& entry) noexcept;
@@ -96,7 +110,6 @@ private:
     void dropUnusedSections();
     std::vector<std::uint32_t> sectionRanks() const;
     void completeFingerprints();
-    std::size_t findFingerprint(std::uint16_t wanted, std::size_t from) const;
 
     std::vector<Entry> entries_;
     std::vector<StoredText> sections_;
@@ -106,7 +119,7 @@ private:
     std::vector<std::wstring*> spare_; // those of them that no text refers to any more
 
     // Each covers as much of the entries and section names as the last look-up saw.
-    std::vector<std::uint16_t> fingerprints_;
+    std::vector<Fingerprint> fingerprints_;
     std::vector<std::uint32_t> sectionFingerprints_;
 };
 

@@ -7,6 +7,8 @@
 #include <cstdint>
 #include <cstring>
 
+#include "text/fingerprint.h"
+
 namespace Koru {
 
 namespace {
@@ -89,46 +91,12 @@ bool isCanonical(std::string_view bytes) {
     return true;
 }
 
-namespace {
-
-/// What a character counts as. Two characters that some locale pairs count as the same: the letters
-/// of ASCII as their lower case, but for those that are paired with characters beyond ASCII (I and
-/// i with the Turkish dotted and dotless i, K with the Kelvin sign), which count as one with all
-/// that is beyond ASCII.
-constexpr std::uint32_t _class(std::uint32_t c) {
-    constexpr std::uint32_t disputed = 0x80;
-    if (c >= 0x80 || c == 'I' || c == 'i' || c == 'K' || c == 'k') return disputed;
-    return c >= 'A' && c <= 'Z' ? c + ('a' - 'A') : c;
-}
-
-constexpr std::array<std::uint8_t, 128> _makeClasses() {
-    std::array<std::uint8_t, 128> classes{};
-    for (std::uint32_t c = 0; c < classes.size(); ++c) {
-        classes[c] = static_cast<std::uint8_t>(_class(c));
-    }
-    return classes;
-}
-
-constexpr std::array<std::uint8_t, 128> CLASSES = _makeClasses();
-
-template <class Cursor>
-std::uint32_t _fingerprint(std::uint32_t before, Cursor cursor) {
-    std::uint32_t result = before;
-    while (wchar_t const c = cursor.next()) {
-        auto const value = static_cast<std::uint32_t>(c);
-        result = (result ^ (value < 0x80 ? CLASSES[value] : 0x80U)) * 0x01000193U; // FNV-1a
-    }
-    return result * 0x9E3779B1U; // spreads to the high bits and sets the next text apart
-}
-
-} // namespace
-
 std::uint32_t fingerprint(std::uint32_t before, StoredText const& text) {
-    return text.withCursor([before](auto cursor) { return _fingerprint(before, cursor); });
+    return text.withCursor([before](auto cursor) { return mixFingerprint(before, cursor); });
 }
 
 std::uint32_t fingerprint(std::uint32_t before, std::wstring const& text) {
-    return _fingerprint(before, WideCursor(text.c_str()));
+    return mixFingerprint(before, WideCursor(text.c_str()));
 }
 
 } // namespace Koru

@@ -89,8 +89,7 @@ bool isPlain(std::string_view bytes);
 /// characters beyond four bytes, of which no text consists.
 bool isCanonical(std::string_view bytes);
 
-/// A number from all characters before the first NUL that continues the one of the text before it.
-/// Equal for any two texts that compare equal, under whatever locale: see the source.
+/// Mixes the text into the number of the text before it, see text/fingerprint.h.
 std::uint32_t fingerprint(std::uint32_t before, StoredText const& text);
 std::uint32_t fingerprint(std::uint32_t before, std::wstring const& text);
 

@@ -1,0 +1,50 @@
+/// @file
+/// A file that text is only appended to.
+#ifndef KORU_LOGFILE_H
+#define KORU_LOGFILE_H
+
+#include <koru/export.h>
+#include <koru/file.h>
+
+namespace Koru {
+
+/// A file opened so that every write goes to its end, also when other processes append to it. What
+/// a line looks like is the caller's business: write to the object as to any stream. Lines of
+/// several processes stay whole when each is flushed at its end and fits the stream's buffer.
+///
+/// Intended: while the log is open its mode is 0. So `synchronize` closes it and then fails with
+/// "failed to open file.".
+///
+/// Stream output does not take the file's lock; threads that share a log guard it with `lock` and
+/// `unlock`.
+class KORU_EXPORT LogFile : public File {
+public:
+    /// Published for callers that format lines; no limit is imposed.
+    static unsigned int const MAX_LINE_LENGTH = 1024U;
+
+    /// A closed file without a name.
+    LogFile();
+
+    /// A closed file.
+    explicit LogFile(File::Path const& path);
+
+    LogFile(LogFile const&) = delete;
+    LogFile& operator=(LogFile const&) = delete;
+
+    /// Closes the file. What goes wrong is lost; flush and look at the stream's state to see it.
+    ~LogFile() override;
+
+    /// Opens the log for appending; its own operation, which hides `File::open`. `READ | WRITE`
+    /// keeps what is there, `WRITE` alone empties the file first; both create a missing file.
+    /// @throws std::runtime_error "failed to open file."; it is closed then. Where the file itself
+    ///         can be opened, as without `WRITE`, a line "File::open() failed to open " and the
+    ///         name goes to standard output first.
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Woverloaded-virtual"
+    virtual void open(unsigned int mode);
+#pragma GCC diagnostic pop
+};
+
+} // namespace Koru
+
+#endif

@@ -1,0 +1,90 @@
+/// @file
+/// A flat settings file.
+#ifndef KORU_PROPERTYFILE_H
+#define KORU_PROPERTYFILE_H
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include <koru/export.h>
+#include <koru/file.h>
+
+namespace Koru {
+
+class SettingsTable;
+
+/// A settings file of `key=value` lines without sections. `open` reads the whole file into a list,
+/// every other operation works on the list, and `close` or the destructor writes it back when the
+/// file was opened for writing.
+///
+/// The format: narrow text in UTF-8 (`make_string`, `make_wstring`), lines ended by a line feed. A
+/// line is trimmed of tabs and blanks; then a first `#` or `;` makes it a comment, and any other
+/// line with `=` is an entry: the key is all before the first `=`, the value all after it, neither
+/// of them trimmed further (`name = value` has the key `name `). Both end at their first NUL. Other
+/// lines and entries with an empty key are ignored. A line that begins with `[` is nothing special.
+///
+/// Intended: a carriage return is ordinary text and stays at the end of values. The list keeps the
+/// order of the lines and is never sorted; comments and blank lines are lost when the file is
+/// written. There is no temporary file: the old file is deleted, then the new one is written.
+///
+/// Keys compare without regard to case (`compare` of <koru/string.h>, under the current C locale)
+/// and keep the case they were given. Where several entries have equal keys, the first counts.
+///
+/// Every operation holds the file's lock from its beginning to its end, so one object may be used
+/// by several threads at once. Results are copies. All operations may throw `std::bad_alloc`.
+class KORU_EXPORT PropertyFile : public File {
+public:
+    /// No limit is imposed on lines; published for callers.
+    static unsigned long const MAX_LINE_LENGTH = 4294967295UL;
+
+    /// A closed file without a name and with an empty list.
+    PropertyFile();
+
+    /// A closed file with an empty list.
+    explicit PropertyFile(File::Path const& path);
+
+    PropertyFile(PropertyFile const&) = delete;
+    PropertyFile& operator=(PropertyFile const&) = delete;
+
+    /// Does what `close` does. What goes wrong is lost; call `close` first to see it.
+    ~PropertyFile() override;
+
+    /// Opens the file as `File::open` does and replaces the list: with `READ` by the entries of the
+    /// file, otherwise by nothing, so that `close` then replaces the whole file.
+    /// @throws std::runtime_error "failed to open file."; the list is unchanged
+    /// @throws std::runtime_error "failed to read from file"; the file stays open, the list holds
+    ///         what was read
+    void open(unsigned long mode) override;
+
+    /// When the mode has `WRITE`: deletes the file and writes it anew. In any case empties the list
+    /// and closes the file. Without `WRITE` changes are lost silently.
+    /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
+    ///         written, the list intact
+    /// @throws std::runtime_error "failed to open file." or "failed to close file."; the list is
+    ///         intact
+    void close() override;
+
+    /// Every key in the order of the list, duplicates included.
+    virtual std::vector<std::wstring> enumerateKeys();
+
+    /// Adds an entry with an empty value at the end, unless the key exists.
+    virtual void createKey(std::wstring const& key);
+
+    /// Removes the first entry with this key; its duplicates stay.
+    virtual void removeKey(std::wstring const& key);
+
+    /// The value of the first entry with this key; empty when there is none.
+    virtual std::wstring getValue(std::wstring const& key);
+
+    /// Replaces the value of the first entry with this key, whose key stays as it was, or adds an
+    /// entry at the end.
+    virtual void setValue(std::wstring const& key, std::wstring const& value);
+
+private:
+    std::unique_ptr<SettingsTable> list_;
+};
+
+} // namespace Koru
+
+#endif

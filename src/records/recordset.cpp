@@ -1,0 +1,174 @@
+#include "records/recordset.h"
+
+#include <algorithm>
+#include <functional>
+#include <new>
+
+#include <koru/string.h>
+
+#include "text/fold.h"
+
+namespace Koru {
+
+namespace {
+
+constexpr std::size_t FIRST_CAPACITY = 64; // records
+
+// The number of a record that was handed out. Its key may have changed, so it is always compared.
+constexpr Fingerprint HANDED_OUT = 0xFFFF;
+
+Fingerprint _fingerprint(std::wstring const& key) {
+    Fingerprint const number = toFingerprint(mixFingerprint(0, WideCursor(key.c_str())));
+    return number == HANDED_OUT ? Fingerprint{HANDED_OUT - 1} : number;
+}
+
+} // namespace
+
+/// Memory for a fixed number of records. Lists never grow beyond that, so only making a block and
+/// copying a record allocate.
+class RecordSet::Block {
+public:
+    explicit Block(std::size_t capacity) : capacity_(capacity), slots_(new Slot[capacity]) {
+        records_.reserve(capacity);
+        numbers_.reserve(capacity);
+        spare_.reserve(capacity);
+    }
+    Block(Block const&) = delete;
+    Block& operator=(Block const&) = delete;
+    ~Block() {
+        for (Record* const record : records_) record->~Record();
+    }
+
+    std::size_t size() const { return records_.size(); }
+    std::size_t capacity() const { return capacity_; }
+    bool hasRoom() const { return records_.size() < capacity_; }
+    bool isBefore(Block const& other) const {
+        return std::less<>()(slots_.get(), other.slots_.get());
+    }
+
+    Record& operator[](std::size_t index) const { return *records_[index]; }
+
+    void markHandedOut(std::size_t index) {
+        numbers_[index] = HANDED_OUT;
+        handedOut_ = true;
+    }
+
+    std::size_t find(std::wstring const& key, Fingerprint number) const {
+        auto const next = [this, number](std::size_t from) {
+            return handedOut_ ? findFingerprint(numbers_, number, HANDED_OUT, from)
+                              : findFingerprint(numbers_, number, from);
+        };
+        std::size_t i = next(0);
+        while (i != NOT_FOUND && compare(records_[i]->getKey(), key) != 0) i = next(i + 1);
+        return i;
+    }
+
+    template <class... Parts>
+    void add(Parts const&... parts) {
+        void* const slot = spare_.empty() ? &slots_[used_] : spare_.back();
+        auto* const copy = new (slot) Record(parts...);
+        if (spare_.empty())
+            ++used_;
+        else
+            spare_.pop_back();
+        auto const place =
+            records_.empty() || std::less<>()(records_.back(), copy)
+                ? records_.end()
+                : std::lower_bound(records_.begin(), records_.end(), copy, std::less<>());
+        numbers_.insert(numbers_.begin() + (place - records_.begin()),
+                        _fingerprint(copy->getKey()));
+        records_.insert(place, copy);
+    }
+
+    void remove(std::size_t index) {
+        auto const offset = static_cast<std::ptrdiff_t>(index);
+        Record* const record = records_[index];
+        records_.erase(records_.begin() + offset);
+        numbers_.erase(numbers_.begin() + offset);
+        record->~Record();
+        spare_.push_back(record);
+    }
+
+private:
+    using Slot = std::aligned_storage_t<sizeof(Record), alignof(Record)>;
+
+    std::size_t capacity_;
+    std::unique_ptr<Slot[]> slots_;
+    std::size_t used_ = 0; // slots from here on never held a record
+    std::vector<void*> spare_;
+    std::vector<Record*> records_;
+    std::vector<Fingerprint> numbers_;
+    bool handedOut_ = false; // whether any number says so
+};
+
+RecordSet::RecordSet() = default;
+
+RecordSet::~RecordSet() = default;
+
+RecordSet::Place RecordSet::at(std::size_t position) const {
+    std::size_t left = position;
+    auto block = blocks_.begin();
+    while (left >= (*block)->size()) left -= (*block++)->size();
+    return Place{block->get(), left};
+}
+
+RecordSet::Record const& RecordSet::operator[](std::size_t position) const {
+    Place const place = at(position);
+    return (*place.block)[place.index];
+}
+
+RecordSet::Record& RecordSet::handOut(std::size_t position) {
+    Place const place = at(position);
+    place.block->markHandedOut(place.index);
+    return (*place.block)[place.index];
+}
+
+RecordSet::Place RecordSet::find(std::wstring const& key) const {
+    Fingerprint const number = _fingerprint(key);
+    for (std::unique_ptr<Block> const& block : blocks_) {
+        std::size_t const index = block->find(key, number);
+        if (index != NOT_FOUND) return Place{block.get(), index};
+    }
+    return Place{nullptr, 0};
+}
+
+RecordSet::Block& RecordSet::blockWithRoom() {
+    std::size_t capacity = 0;
+    for (std::unique_ptr<Block> const& block : blocks_) {
+        if (block->hasRoom()) return *block;
+        capacity += block->capacity();
+    }
+    auto added = std::make_unique<Block>(std::max(capacity, FIRST_CAPACITY));
+    Block& result = *added;
+    auto const place =
+        std::upper_bound(blocks_.begin(), blocks_.end(), added,
+                         [](std::unique_ptr<Block> const& a, std::unique_ptr<Block> const& b) {
+                             return a->isBefore(*b);
+                         });
+    blocks_.insert(place, std::move(added));
+    return result;
+}
+
+void RecordSet::add(Record const& record) {
+    blockWithRoom().add(record);
+    ++size_;
+}
+
+void RecordSet::add(std::wstring const& key, std::vector<unsigned char> const& data) {
+    blockWithRoom().add(key, data);
+    ++size_;
+}
+
+void RecordSet::remove(std::wstring const& key) {
+    Place const place = find(key);
+    if (place.block == nullptr) return;
+    place.block->remove(place.index);
+    --size_;
+}
+
+void RecordSet::clear() {
+    blocks_.clear();
+    size_ = 0;
+}
+
+} // namespace Koru

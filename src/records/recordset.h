@@ -1,0 +1,69 @@
+// The records that a record file holds, in the order of their addresses.
+//
+// They are kept in a few blocks of memory, each twice as large as all before it, and each with a
+// list of its records in the order of their addresses. So a position is found within a few steps,
+// and a new record mostly goes to the end of a list. A column of fingerprints beside each list
+// makes looking for a key quick.
+#ifndef KORU_RECORDS_RECORDSET_H
+#define KORU_RECORDS_RECORDSET_H
+
+#include <koru/datafile.h>
+
+#include <cstddef>
+#include <memory>
+#include <string>
+#include <type_traits>
+#include <vector>
+
+#include "text/fingerprint.h"
+
+namespace Koru {
+
+class RecordSet {
+public:
+    using Record = DataFile::Record;
+
+    RecordSet();
+    RecordSet(RecordSet const&) = delete;
+    RecordSet& operator=(RecordSet const&) = delete;
+    ~RecordSet();
+
+    std::size_t size() const { return size_; }
+
+    /// The record at a position below the size.
+    Record const& operator[](std::size_t position) const;
+
+    /// The same for a caller who may change the key at any time from now on.
+    Record& handOut(std::size_t position);
+
+    /// Whether a record with an equal key is held.
+    bool holds(std::wstring const& key) const { return find(key).block != nullptr; }
+
+    /// Holds a copy of the record, or a record made of key and data (which see for what is thrown).
+    void add(Record const& record);
+    void add(std::wstring const& key, std::vector<unsigned char> const& data);
+
+    /// Destroys the first record with an equal key, if there is one.
+    void remove(std::wstring const& key);
+
+    /// Destroys all records.
+    void clear();
+
+private:
+    class Block;
+    struct Place {
+        Block* block;
+        std::size_t index;
+    };
+
+    Place at(std::size_t position) const;
+    Place find(std::wstring const& key) const;
+    Block& blockWithRoom();
+
+    std::vector<std::unique_ptr<Block>> blocks_; // in the order of their addresses
+    std::size_t size_ = 0;
+};
+
+} // namespace Koru
+
+#endif
