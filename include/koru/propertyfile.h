@@ -61,8 +61,9 @@ public:
     /// and closes the file. Without `WRITE` changes are lost silently.
     /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
     ///         written, the list intact
-    /// @throws std::runtime_error "failed to open file." or "failed to close file."; the list is
-    ///         intact
+    /// @throws std::runtime_error "failed to open file."; the old file is gone then, the mode 0, the
+    ///         list intact: `setMode` and another `close` try again
+    /// @throws std::runtime_error "failed to close file."
     void close() override;
 
     /// Every key in the order of the list, duplicates included.

@@ -45,6 +45,19 @@ void require(bool done) {
     if (!done) throw std::runtime_error("an instruction failed");
 }
 
+/// The name while no file can be opened, for want of descriptors.
+std::string processFileNameWithoutFiles() {
+    rlimit limit{};
+    require(::getrlimit(RLIMIT_NOFILE, &limit) == 0);
+    rlimit const none{0, limit.rlim_max};
+    require(::setrlimit(RLIMIT_NOFILE, &none) == 0);
+    bool const refused = ::open("/proc/self/cmdline", O_RDONLY | O_CLOEXEC) == -1;
+    std::string name = processFileName();
+    require(::setrlimit(RLIMIT_NOFILE, &limit) == 0);
+    require(refused);
+    return name;
+}
+
 /// `NAME` is what the library says, `EXPECTED=argv0` what it has to say in the same state of the
 /// process; the others change that state.
 int follow(int count, char** instructions) {
@@ -66,10 +79,8 @@ int follow(int count, char** instructions) {
             // argv[0], two places before the first instruction, lies where cmdline is read from.
             require(operand.size() == std::strlen(instructions[-2]));
             std::memcpy(instructions[-2], operand.data(), operand.size());
-        } else if (verb == "NO_DESCRIPTORS") {
-            rlimit const none{0, 0};
-            require(::setrlimit(RLIMIT_NOFILE, &none) == 0);
-            require(::open("/proc/self/cmdline", O_RDONLY | O_CLOEXEC) == -1);
+        } else if (verb == "NAME_WITHOUT_FILES") {
+            test::answer(processFileNameWithoutFiles());
         } else {
             return 1;
         }
@@ -413,8 +424,8 @@ TEST_CASE("the first argument is read at every call, as the process may overwrit
 TEST_CASE("a process that can open no file has an empty name") {
     test::TempDir const dir;
     test::copyOwnExecutable(dir / "prog");
-    CHECK(follow(dir / "prog", dir / "prog", "/", {"NAME", "NO_DESCRIPTORS", "NAME"}) ==
-          Strings{dir / "prog", ""});
+    CHECK(follow(dir / "prog", dir / "prog", "/", {"NAME", "NAME_WITHOUT_FILES", "NAME"}) ==
+          Strings{dir / "prog", "", dir / "prog"});
 }
 
 TEST_CASE("getProcessFileName leaves no file open") {

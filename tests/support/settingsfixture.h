@@ -1,0 +1,110 @@
+// A settings file in a directory of its own, and ways to see all that an InitializationFile holds.
+#ifndef KORU_TESTS_SETTINGSFIXTURE_H
+#define KORU_TESTS_SETTINGSFIXTURE_H
+
+#include <doctest/doctest.h>
+
+#include <cstddef>
+#include <filesystem>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include <koru/initializationfile.h>
+
+#include "support/settingsmodel.h"
+#include "support/tempdir.h"
+
+namespace test {
+
+unsigned long const READ = Koru::File::READ;
+unsigned long const WRITE = Koru::File::WRITE;
+unsigned long const READ_WRITE = Koru::File::READ | Koru::File::WRITE;
+
+/// A settings file's place, without the file at first.
+class SettingsPlace {
+public:
+    std::string const& path() const { return path_; }
+    TempDir const& directory() const { return directory_; }
+    /// Writes a new file; some file systems are slow in emptying one that is there.
+    void write(std::string const& bytes) const {
+        std::filesystem::remove(path_);
+        writeFile(path_, bytes);
+    }
+    std::string bytes() const { return readFile(path_); }
+    bool exists() const { return std::filesystem::exists(path_); }
+
+private:
+    TempDir directory_;
+    std::string path_ = directory_ / "settings.ini";
+};
+
+/// Takes the table apart from its front and returns it, each entry exactly as it is held: the first
+/// section enumerated and its first key are those of the first entry.
+inline Settings drain(Koru::InitializationFile& file) {
+    Settings all;
+    for (;;) {
+        std::vector<std::wstring> const sections = file.enumerateSections();
+        if (sections.empty()) return all;
+        std::wstring const section = sections[0];
+        std::wstring const key = file.enumerateKeys(section).at(0);
+        all.push_back({section, key, file.getValue(section, key)});
+        file.removeKey(section, key);
+        if (all.size() > 100000) throw std::runtime_error("the table does not get smaller");
+    }
+}
+
+/// The table that a file of these bytes is read into.
+inline Settings loaded(SettingsPlace const& place, std::string const& bytes) {
+    place.write(bytes);
+    Koru::InitializationFile file(place.path());
+    file.open(READ);
+    return drain(file);
+}
+
+/// The bytes that a table, filled in this order, is written as.
+inline std::string written(SettingsPlace const& place, Settings const& settings) {
+    Koru::InitializationFile file(place.path());
+    file.open(WRITE);
+    for (Setting const& s : settings) file.setValue(s.section, s.key, s.value);
+    file.close();
+    return place.bytes();
+}
+
+/// Both are the same, shown when not.
+inline void checkSame(Settings const& actual, Settings const& expected) {
+    bool const same = actual == expected;
+    INFO("actual:\n", shown(actual), "expected:\n", shown(expected));
+    CHECK(same);
+}
+
+inline void checkSame(std::vector<std::wstring> const& actual,
+                      std::vector<std::wstring> const& expected) {
+    bool const same = actual == expected;
+    INFO("actual: ", shown(actual), "expected: ", shown(expected));
+    CHECK(same);
+}
+
+inline void checkSame(std::wstring const& actual, std::wstring const& expected) {
+    CHECK(shown(actual) == shown(expected));
+}
+
+inline void checkSame(std::string const& actual, std::string const& expected) {
+    CHECK(shown(actual) == shown(expected));
+}
+
+/// Every section, key and value that the library gives is the model's.
+inline void checkTable(Koru::InitializationFile& file, SettingsTableModel const& model) {
+    std::vector<std::wstring> const sections = model.enumerateSections();
+    checkSame(file.enumerateSections(), sections);
+    for (std::wstring const& section : sections) {
+        checkSame(file.enumerateKeys(section), model.enumerateKeys(section));
+    }
+    for (Setting const& s : model.settings) {
+        checkSame(file.getValue(s.section, s.key), model.getValue(s.section, s.key));
+    }
+}
+
+} // namespace test
+
+#endif

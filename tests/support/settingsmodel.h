@@ -1,0 +1,276 @@
+// What a sectioned settings file does, in the plainest way: three wide strings per entry, every
+// operation a loop over all of them, and a file that is a string. Tests compare the library with
+// it.
+#ifndef KORU_TESTS_SETTINGSMODEL_H
+#define KORU_TESTS_SETTINGSMODEL_H
+
+#include <algorithm>
+#include <cstddef>
+#include <string>
+#include <vector>
+
+#include <koru/file.h>
+#include <koru/string.h>
+
+namespace test {
+
+/// An entry of the table.
+struct Setting {
+    std::wstring section;
+    std::wstring key;
+    std::wstring value;
+};
+
+inline bool operator==(Setting const& a, Setting const& b) {
+    return a.section == b.section && a.key == b.key && a.value == b.value;
+}
+
+using Settings = std::vector<Setting>;
+
+/// A wide string for a test's output: what is not printable ASCII as its number in hexadecimal,
+/// between angle brackets.
+inline std::string shown(std::wstring const& text) {
+    static char const digits[] = "0123456789abcdef";
+    std::string result;
+    for (wchar_t const c : text) {
+        if (c >= 0x20 && c < 0x7F && c != L'<') {
+            result += static_cast<char>(c);
+            continue;
+        }
+        result += '<';
+        bool leading = true;
+        for (int shift = 28; shift >= 0; shift -= 4) {
+            unsigned const digit = (static_cast<unsigned>(c) >> shift) & 15U;
+            leading = leading && digit == 0 && shift > 0;
+            if (!leading) result += digits[digit];
+        }
+        result += '>';
+    }
+    return result;
+}
+
+/// The same for bytes.
+inline std::string shown(std::string const& bytes) {
+    std::wstring wide;
+    for (char const c : bytes) wide += static_cast<wchar_t>(static_cast<unsigned char>(c));
+    return shown(wide);
+}
+
+inline std::string shown(std::vector<std::wstring> const& names) {
+    std::string result;
+    for (std::wstring const& name : names) result += '"' + shown(name) + "\" ";
+    return result;
+}
+
+inline std::string shown(Settings const& settings) {
+    std::string result;
+    for (Setting const& s : settings) {
+        result += '[' + shown(s.section) + "] " + shown(s.key) + '=' + shown(s.value) + '\n';
+    }
+    return result;
+}
+
+/// Names are the same when they differ in case only.
+inline bool sameName(std::wstring const& a, std::wstring const& b) {
+    return Koru::compare(a, b) == 0;
+}
+
+/// Parses one line: a header sets the section, a key line sets key and value, any other line
+/// nothing.
+inline void parseSettingsLine(std::string line, std::wstring& section, std::wstring& key,
+                              std::wstring& value) {
+    std::size_t const last = line.find_last_not_of("\t ");
+    if (last != std::string::npos) line.erase(last + 1);
+    std::size_t const first = line.find_first_not_of("\t ");
+    if (first != std::string::npos) line.erase(0, first);
+
+    if (line.empty() || line[0] == '#' || line[0] == ';') return;
+    if (line[0] == '[') {
+        std::size_t const beforeRun = line.find_last_not_of(']');
+        if (beforeRun != std::string::npos) line.erase(beforeRun + 1);
+        std::size_t const afterRun = line.find_first_not_of('[');
+        if (afterRun != std::string::npos) line.erase(0, afterRun);
+        section = Koru::make_wstring(line);
+        return;
+    }
+    std::size_t const equals = line.find('=');
+    if (equals == std::string::npos) return;
+    key = Koru::make_wstring(line.substr(0, equals));
+    value = Koru::make_wstring(line.substr(equals + 1));
+}
+
+/// The entries of a file's bytes in the order of its lines.
+inline Settings parseSettings(std::string const& bytes) {
+    Settings settings;
+    std::wstring section;
+    std::size_t at = 0;
+    while (at < bytes.size()) {
+        if (bytes[at] == '\n') {
+            ++at;
+            continue;
+        }
+        std::size_t const end = std::min(bytes.find('\n', at), bytes.size());
+        std::wstring key;
+        std::wstring value;
+        parseSettingsLine(bytes.substr(at, end - at), section, key, value);
+        if (!section.empty() && !key.empty()) settings.push_back({section, key, value});
+        at = end;
+    }
+    return settings;
+}
+
+/// Sorts by section and key; entries with equal names keep their order.
+inline void sortSettings(Settings& settings) {
+    std::stable_sort(settings.begin(), settings.end(), [](Setting const& a, Setting const& b) {
+        int const bySection = Koru::compare(a.section, b.section);
+        if (bySection != 0) return bySection < 0;
+        return Koru::compare(a.key, b.key) < 0;
+    });
+}
+
+/// The bytes that a table in this order is written as.
+inline std::string settingsText(Settings const& settings) {
+    std::string text;
+    Setting const* previous = nullptr;
+    for (Setting const& entry : settings) {
+        if (previous == nullptr || !sameName(entry.section, previous->section)) {
+            text += "[" + Koru::make_string(entry.section) + "]\n";
+        }
+        text += Koru::make_string(entry.key) + "=" + Koru::make_string(entry.value) + "\n";
+        previous = &entry;
+    }
+    return text;
+}
+
+/// The table and its operations.
+class SettingsTableModel {
+public:
+    Settings settings;
+
+    std::vector<std::wstring> enumerateSections() const {
+        std::vector<std::wstring> names;
+        for (std::size_t i = 0; i < settings.size(); ++i) {
+            if (i == 0 || !sameName(settings[i].section, settings[i - 1].section)) {
+                names.push_back(settings[i].section);
+            }
+        }
+        return names;
+    }
+
+    void createSection(std::wstring const& section) {
+        for (Setting const& entry : settings) {
+            if (sameName(entry.section, section)) return;
+        }
+        settings.push_back({section, L"", L""});
+    }
+
+    void removeSection(std::wstring const& section) {
+        for (std::size_t i = 0; i < settings.size(); ++i) {
+            if (sameName(settings[i].section, section)) removeAt(i);
+        }
+    }
+
+    std::vector<std::wstring> enumerateKeys(std::wstring const& section) const {
+        std::vector<std::wstring> keys;
+        for (Setting const& entry : settings) {
+            if (sameName(entry.section, section)) keys.push_back(entry.key);
+        }
+        return keys;
+    }
+
+    void createKey(std::wstring const& section, std::wstring const& key) {
+        if (find(section, key) == settings.size()) settings.push_back({section, key, L""});
+    }
+
+    void removeKey(std::wstring const& section, std::wstring const& key) {
+        std::size_t const at = find(section, key);
+        if (at < settings.size()) removeAt(at);
+    }
+
+    std::wstring getValue(std::wstring const& section, std::wstring const& key) const {
+        std::size_t const at = find(section, key);
+        return at < settings.size() ? settings[at].value : std::wstring();
+    }
+
+    void setValue(std::wstring const& section, std::wstring const& key, std::wstring const& value) {
+        std::size_t const at = find(section, key);
+        if (at < settings.size()) {
+            settings[at].value = value;
+        } else {
+            settings.push_back({section, key, value});
+        }
+    }
+
+private:
+    std::size_t find(std::wstring const& section, std::wstring const& key) const {
+        for (std::size_t i = 0; i < settings.size(); ++i) {
+            if (sameName(settings[i].section, section) && sameName(settings[i].key, key)) return i;
+        }
+        return settings.size();
+    }
+
+    void removeAt(std::size_t at) {
+        settings.erase(settings.begin() + static_cast<std::ptrdiff_t>(at));
+    }
+};
+
+/// The table with its file, mode and life cycle.
+class SettingsFileModel : public SettingsTableModel {
+public:
+    bool exists = false; ///< whether the file is on the disk
+    std::string bytes;   ///< what it holds then
+
+    bool isOpen() const { return open_; }
+    unsigned long getMode() const { return mode_; }
+    void setMode(unsigned long mode) { mode_ = mode; }
+
+    /// False where the library throws "failed to open file.".
+    bool open(unsigned long mode) {
+        if (!open_ && !openStream(mode)) return false;
+        mode_ = mode;
+        settings.clear();
+        if (reads(mode) && readable_) settings = parseSettings(bytes);
+        sortSettings(settings);
+        return true;
+    }
+
+    void close() {
+        sortSettings(settings);
+        if (writes(mode_)) {
+            exists = true;
+            bytes = settingsText(settings);
+        }
+        settings.clear();
+        open_ = false;
+        mode_ = 0;
+    }
+
+    bool synchronize() {
+        if (!open_) return true;
+        unsigned long const mode = mode_;
+        close();
+        return open(mode);
+    }
+
+private:
+    bool open_ = false;
+    bool readable_ = false; // of the open stream, whatever mode was set since
+    unsigned long mode_ = 0;
+
+    static bool reads(unsigned long mode) { return (mode & Koru::File::READ) != 0; }
+    static bool writes(unsigned long mode) { return (mode & Koru::File::WRITE) != 0; }
+
+    bool openStream(unsigned long mode) {
+        if (!reads(mode) && !writes(mode)) return false;
+        if (!writes(mode) && !exists) return false;
+        if (!reads(mode) || !exists) bytes.clear();
+        exists = true;
+        open_ = true;
+        readable_ = reads(mode);
+        return true;
+    }
+};
+
+} // namespace test
+
+#endif
