@@ -1,6 +1,6 @@
 #include <koru/string.h>
 
-#include <emmintrin.h>
+#include <cxxabi.h>
 #include <strings.h>
 
 #include <algorithm>
@@ -11,56 +11,14 @@
 
 #include "text/convert.h"
 #include "text/fold.h"
+#include "text/simd.h"
+#include "text/utf8.h"
 
 namespace Koru {
 
 // First of all objects of the library, since every other one may ask for them.
 __attribute__((init_priority(101))) std::string const _null_string;
 __attribute__((init_priority(101))) std::wstring const _null_wstring;
-
-namespace {
-
-// Text is converted block by block in a buffer on the stack, so that a string is allocated once and
-// no memory is written twice.
-constexpr std::size_t BLOCK = 512;
-
-__m128i _load(void const* from) { return _mm_loadu_si128(static_cast<__m128i const*>(from)); }
-
-void _store(void* to, __m128i value) { _mm_storeu_si128(static_cast<__m128i*>(to), value); }
-
-/// Widens the ASCII characters that the text begins with, up to `end`. Moves both pointers on.
-void _widenAscii(char const*& s, char const* end, wchar_t*& to) {
-    __m128i const zero = _mm_setzero_si128();
-    for (; end - s >= 16; s += 16, to += 16) {
-        __m128i const bytes = _load(s);
-        if (_mm_movemask_epi8(bytes) != 0) break;
-        __m128i const low = _mm_unpacklo_epi8(bytes, zero);
-        __m128i const high = _mm_unpackhi_epi8(bytes, zero);
-        _store(to, _mm_unpacklo_epi16(low, zero));
-        _store(to + 4, _mm_unpackhi_epi16(low, zero));
-        _store(to + 8, _mm_unpacklo_epi16(high, zero));
-        _store(to + 12, _mm_unpackhi_epi16(high, zero));
-    }
-    for (; s != end && static_cast<signed char>(*s) >= 0; ++s) *to++ = *s;
-}
-
-/// Narrows the characters from 0 to 127 that the text begins with. Moves both pointers on.
-void _narrowAscii(wchar_t const*& s, wchar_t const* end, char*& to) {
-    __m128i const beyond = _mm_set1_epi32(~0x7F);
-    for (; end - s >= 16; s += 16, to += 16) {
-        __m128i const a = _load(s);
-        __m128i const b = _load(s + 4);
-        __m128i const c = _load(s + 8);
-        __m128i const d = _load(s + 12);
-        __m128i const any =
-            _mm_and_si128(_mm_or_si128(_mm_or_si128(a, b), _mm_or_si128(c, d)), beyond);
-        if (_mm_movemask_epi8(_mm_cmpeq_epi32(any, _mm_setzero_si128())) != 0xFFFF) break;
-        _store(to, _mm_packus_epi16(_mm_packs_epi32(a, b), _mm_packs_epi32(c, d)));
-    }
-    for (; s != end && static_cast<std::uint32_t>(*s) < 0x80; ++s) *to++ = static_cast<char>(*s);
-}
-
-} // namespace
 
 std::size_t length(char const* s) { return s == nullptr ? 0 : std::strlen(s); }
 
@@ -72,13 +30,54 @@ std::size_t length(std::wstring const& s) { return ::wcsnlen(s.data(), s.size())
 
 int compare(char const* a, char const* b) { return ::strcasecmp(a, b); }
 
-int compare(std::string const& a, std::string const& b) { return compare(a.c_str(), b.c_str()); }
+int compare(std::string const& a, std::string const& b) {
+    return ::strcasecmp(a.c_str(), b.c_str());
+}
 
 int compare(wchar_t const* a, wchar_t const* b) {
     return compareFolded(WideCursor(a), WideCursor(b));
 }
 
-int compare(std::wstring const& a, std::wstring const& b) { return compare(a.c_str(), b.c_str()); }
+namespace {
+
+/// How four pairs of characters compare; in each lane all bits or none.
+struct FourPairs {
+    FourPairs(__m128i a, __m128i b) {
+        __m128i const caseBit = _mm_set1_epi32(0x20);
+        __m128i const difference = _mm_xor_si128(a, b);
+        __m128i const lowered = _mm_or_si128(a, caseBit);
+        __m128i const letters = _mm_and_si128(_mm_cmpgt_epi32(lowered, _mm_set1_epi32('a' - 1)),
+                                              _mm_cmplt_epi32(lowered, _mm_set1_epi32('z' + 1)));
+        __m128i const otherCase = _mm_and_si128(letters, _mm_cmpeq_epi32(difference, caseBit));
+        __m128i const zero = _mm_setzero_si128();
+        same = _mm_andnot_si128(_mm_cmpeq_epi32(a, zero),
+                                _mm_or_si128(otherCase, _mm_cmpeq_epi32(difference, zero)));
+        disputed = _mm_and_si128(otherCase, _mm_cmpeq_epi32(lowered, _mm_set1_epi32('i')));
+    }
+
+    __m128i same;     ///< equal but for the case of an ASCII letter, and not NUL
+    __m128i disputed; ///< I and i
+};
+
+/// How many characters, in steps of four, two texts are sure to have in common, case aside.
+std::size_t _commonPrefix(wchar_t const* a, wchar_t const* b, std::size_t size) {
+    __m128i disputed = _mm_setzero_si128();
+    std::size_t i = 0;
+    for (; size - i >= 4; i += 4) {
+        FourPairs const pairs(load16(a + i), load16(b + i));
+        if (highBits(pairs.same) != ALL_BYTES) break;
+        disputed = _mm_or_si128(disputed, pairs.disputed);
+    }
+    bool const agreed = highBits(disputed) == 0 || lower(L'I') == L'i';
+    return agreed ? i : 0;
+}
+
+} // namespace
+
+int compare(std::wstring const& a, std::wstring const& b) {
+    std::size_t const common = _commonPrefix(a.data(), b.data(), std::min(a.size(), b.size()));
+    return compareFolded(WideCursor(a.c_str() + common), WideCursor(b.c_str() + common));
+}
 
 std::string make_string(char const* s) { return length(s) == 0 ? _null_string : std::string(s); }
 
@@ -88,154 +87,110 @@ std::wstring make_wstring(wchar_t const* s) {
 
 std::string make_string(wchar_t const* s) { return make_string(make_wstring(s)); }
 
-std::wstring make_wstring(char const* s) { return make_wstring(s, length(s)); }
-
-std::wstring make_wstring(std::string const& s) { return make_wstring(s.data(), s.size()); }
-
 namespace {
 
-/// Decodes characters to a block of `BLOCK` until it is full, the text ends or a zero comes out.
-/// Moves `s` on and returns the end of what was written.
-wchar_t* _decodeBlock(char const*& s, char const* end, wchar_t* to) {
-    wchar_t const* const full = to + BLOCK;
-    while (s != end && to != full) {
-        _widenAscii(s, s + std::min(end - s, full - to), to);
-        if (s == end || to == full) break;
-        Decoded const c = decodeOne(s, static_cast<std::size_t>(end - s));
-        if (c.value == 0) {
-            s = end; // The result ends here.
-            break;
-        }
-        s += c.size;
-        *to++ = c.value;
-    }
-    return to;
-}
-
-/// The number of bytes that are not continuation bytes: the number of characters, if the text is
-/// well-formed.
-std::size_t _countLeads(char const* s, std::size_t size) {
-    return static_cast<std::size_t>(
-        std::count_if(s, s + size, [](char c) { return static_cast<signed char>(c) >= -0x40; }));
-}
-
-} // namespace
-
-std::wstring make_wstring(char const* s, std::size_t size) {
-    char const* const end = s + ::strnlen(s, size);
+/// Decodes text without zero bytes.
+std::wstring _decode(char const* s, char const* end) {
     if (s == end) return _null_wstring;
+    bool const shuffle = canShuffle();
     wchar_t block[BLOCK];
-    wchar_t* filled = _decodeBlock(s, end, block);
+    wchar_t* filled = decodeBlock(s, end, block, shuffle);
     if (s == end) return std::wstring(block, filled);
     std::wstring result;
     result.reserve(static_cast<std::size_t>(filled - block) +
-                   _countLeads(s, static_cast<std::size_t>(end - s)));
-    result.append(block, filled);
-    while (s != end) {
-        filled = _decodeBlock(s, end, block);
-        result.append(block, filled);
+                   countLeads(s, static_cast<std::size_t>(end - s)));
+    for (result.append(block, filled); s != end; result.append(block, filled)) {
+        filled = decodeBlock(s, end, block, shuffle);
     }
     return result;
 }
 
-namespace {
-
-constexpr std::size_t LONGEST_FORM = 6;
-
-/// Writes one character and returns the end of what was written.
-char* _encodeOne(std::int32_t c, char* to) {
-    auto const put = [&to](std::int32_t byte) { *to++ = static_cast<char>(byte); };
-    auto const tail = [&put, c](int shift) { put(0x80 | ((c >> shift) & 0x3F)); };
-    if (c <= 0x7F) { // Intended: a negative value becomes its low byte.
-        put(c & 0xFF);
-    } else if (c <= 0x7FF) {
-        put(0xC0 | c >> 6), tail(0);
-    } else if (c <= 0xFFFF) {
-        put(0xE0 | c >> 12), tail(6), tail(0);
-    } else if (c <= 0x1FFFFF) {
-        put(0xF0 | c >> 18), tail(12), tail(6), tail(0);
-    } else if (c <= 0x3FFFFFF) {
-        put(0xF8 | c >> 24), tail(18), tail(12), tail(6), tail(0);
-    } else {
-        put(0xFC | c >> 30), tail(24), tail(18), tail(12), tail(6), tail(0);
-    }
-    return to;
-}
-
-/// Encodes characters until fewer than `LONGEST_FORM` bytes are free before `full`, the text ends
-/// or a zero byte would come out. Moves `s` on and returns the end of what was written.
-char* _encodeSome(wchar_t const*& s, wchar_t const* end, char* to, char const* full) {
-    while (s != end && full - to >= static_cast<std::ptrdiff_t>(LONGEST_FORM)) {
-        _narrowAscii(s, s + std::min<std::ptrdiff_t>(end - s, full - to), to);
-        if (s == end || full - to < static_cast<std::ptrdiff_t>(LONGEST_FORM)) break;
-        if (*s < 0 && (*s & 0xFF) == 0) {
-            s = end; // The result ends here.
-            break;
-        }
-        to = _encodeOne(*s++, to);
-    }
-    return to;
-}
-
 } // namespace
 
-std::size_t encodedBound(wchar_t const* s, std::size_t size) {
-    std::size_t bytes = 0;
-    for (wchar_t const* const end = s + size; s != end; ++s) {
-        bytes +=
-            1U + (*s > 0x7F) + (*s > 0x7FF) + (*s > 0xFFFF) + (*s > 0x1FFFFF) + (*s > 0x3FFFFFF);
+std::wstring make_wstring(char const* s) { return _decode(s, s + length(s)); }
+
+std::wstring make_wstring(std::string const& s) {
+    return _decode(s.data(), s.data() + ::strnlen(s.data(), s.size()));
+}
+
+std::wstring make_wstring(char const* s, std::size_t size) {
+    return _decode(s, s + ::strnlen(s, size));
+}
+
+std::string make_string(std::wstring const& text) {
+    wchar_t const* s = text.data();
+    wchar_t const* const end = s + text.size();
+    if (s == end) return _null_string;
+    bool const shuffle = canShuffle();
+    char block[BLOCK];
+    char* filled = encodeBlock(s, end, block, shuffle);
+    if (s == end) return std::string(block, filled);
+    std::string result;
+    result.reserve(static_cast<std::size_t>(filled - block) +
+                   encodedBound(s, static_cast<std::size_t>(end - s)));
+    for (result.append(block, filled); s != end; result.append(block, filled)) {
+        filled = encodeBlock(s, end, block, shuffle);
     }
-    return bytes;
+    return result;
 }
 
 char* encode(wchar_t const* s, std::size_t size, char* to) {
-    wchar_t const* const end = s + ::wcsnlen(s, size);
+    bool const shuffle = canShuffle();
     char block[BLOCK];
-    while (s != end) {
-        std::size_t const bytes =
-            static_cast<std::size_t>(_encodeSome(s, end, block, block + BLOCK) - block);
+    for (wchar_t const* const end = s + size; s != end;) {
+        auto const bytes = static_cast<std::size_t>(encodeBlock(s, end, block, shuffle) - block);
         std::memcpy(to, block, bytes);
         to += bytes;
     }
     return to;
 }
 
-std::string make_string(std::wstring const& text) {
-    wchar_t const* s = text.data();
-    wchar_t const* const end = s + length(text);
-    if (s == end) return _null_string;
-    char block[BLOCK];
-    char* filled = _encodeSome(s, end, block, block + BLOCK);
-    if (s == end) return std::string(block, filled);
-    std::string result;
-    result.reserve(static_cast<std::size_t>(filled - block) +
-                   encodedBound(s, static_cast<std::size_t>(end - s)));
-    result.append(block, filled);
-    while (s != end) {
-        filled = _encodeSome(s, end, block, block + BLOCK);
-        result.append(block, filled);
-    }
-    return result;
-}
-
 namespace {
 
-/// Whether a block written at once looks like its characters inserted one by one: with a width the
-/// first one is padded, with unitbuf each one is flushed.
-bool _takesBlocks(std::ostream const& os) {
-    return os.width() == 0 && (os.flags() & std::ios::unitbuf) == 0;
+/// Whether inserting characters one by one comes down to handing each to the stream's buffer: a
+/// width pads the first one, unitbuf flushes each, a tied stream is flushed before each.
+inline bool _passesThrough(std::ostream const& os) {
+    return os.good() && os.width() == 0 && (os.flags() & std::ios::unitbuf) == 0 &&
+           os.tie() == nullptr;
 }
 
-/// Inserts characters one by one, as formatted output.
-void _insertEach(std::ostream& os, char const* s, std::size_t size) {
-    for (char const* const end = s + size; s != end; ++s) os << *s;
+/// Notes that the buffer threw, as formatted output does: without an exception of the stream's own.
+void _setBad(std::ostream& os) {
+    try {
+        os.setstate(std::ios::badbit);
+    } catch (std::ios::failure const&) { // The buffer's exception takes its place.
+    }
 }
 
-void _insert(std::ostream& os, char const* s, std::size_t size) {
-    if (size != 0 && _takesBlocks(os))
-        os.write(s, static_cast<std::streamsize>(size));
-    else
-        _insertEach(os, s, size);
+/// Hands the characters up to `last` and that one to the buffer, at once but with the outcome of
+/// one by one: the first that fails makes the stream bad, and the next after that makes it fail.
+/// The unwinding of a cancelled thread carries no object, which the sanitizer takes for a null
+/// reference.
+__attribute__((no_sanitize("null"))) void _passThrough(std::ostream& os, char const* s,
+                                                       char const* last) {
+    bool onlyLast = false;
+    try {
+        onlyLast = os.rdbuf()->sputn(s, last - s) == last - s;
+        if (onlyLast && os.rdbuf()->sputc(*last) != std::char_traits<char>::eof()) return;
+        os.setstate(std::ios::badbit);
+    } catch (abi::__forced_unwind const&) {
+        _setBad(os);
+        throw;
+    } catch (...) {
+        _setBad(os);
+        if ((os.exceptions() & std::ios::badbit) != 0) throw;
+    }
+    if (!onlyLast) os.setstate(std::ios::failbit);
+}
+
+/// Inserts characters, at least one, as formatted output.
+inline void _insert(std::ostream& os, char const* s, std::size_t size) {
+    char const* const last = s + size - 1;
+    if (_passesThrough(os)) {
+        _passThrough(os, s, last);
+        return;
+    }
+    for (; s <= last; ++s) os << *s;
 }
 
 } // namespace
