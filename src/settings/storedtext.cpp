@@ -32,11 +32,20 @@ std::size_t _commonPrefix(std::string_view a, std::string_view b) {
     return i;
 }
 
+/// Whether towlower leaves a character of ASCII as it is, in every locale.
+bool _isItsOwnLower(char c) { return c > 0 && (c < 'A' || c > 'Z'); }
+
 } // namespace
 
 int compare(StoredText const& a, StoredText const& b) {
     if (a.wide() == nullptr && b.wide() == nullptr) {
         std::size_t const common = _commonPrefix(a.bytes(), b.bytes());
+        // Mostly the two characters behind it decide.
+        if (common < std::min(a.bytes().size(), b.bytes().size())) {
+            char const x = a.bytes()[common];
+            char const y = b.bytes()[common];
+            if (_isItsOwnLower(x) && _isItsOwnLower(y)) return x - y;
+        }
         return compareFolded(BytesCursor(a.bytes().substr(common)),
                              BytesCursor(b.bytes().substr(common)));
     }

@@ -15,6 +15,7 @@
 #include <chrono>
 #include <ctime>
 #include <fstream>
+#include <functional>
 #include <limits>
 #include <memory>
 #include <string>
@@ -34,6 +35,7 @@ struct TimedWait {
     int answer = WAITS;
     int calls = 0;
     bool mutexHeld = false;
+    std::function<void()> meanwhile; ///< called before it answers, with the mutex held
     timespec deadline = {};
 };
 thread_local TimedWait timedWait;
@@ -46,6 +48,7 @@ extern "C" int pthread_cond_timedwait(pthread_cond_t* condition, pthread_mutex_t
     ++timedWait.calls;
     timedWait.deadline = *deadline;
     timedWait.mutexHeld = ::pthread_mutex_trylock(mutex) == EBUSY;
+    if (timedWait.meanwhile) timedWait.meanwhile();
     if (timedWait.answer != TimedWait::WAITS) return timedWait.answer;
     return ::pthread_cond_clockwait(condition, mutex, CLOCK_REALTIME, deadline);
 }
@@ -489,21 +492,56 @@ TEST_CASE("a wait returns 0 when woken, 1 when time ran out, -1 for every other 
     }
 }
 
-TEST_CASE("a wait without limit does not use the timed wait") {
-    Koru::Event event(true);
-    int calls = -1;
-    std::atomic<bool> returned{false};
-    std::thread thread([&] {
-        event.wait();
-        calls = timedWait.calls;
-        returned = true;
-    });
-    while (!returned) {
-        event.signal();
-        ::usleep(1000);
+TEST_CASE("every operation takes the event's mutex") {
+    struct Row {
+        std::string label;
+        void (*operation)(Koru::Event&);
+    };
+    Row const rows[] = {{"signal", [](Koru::Event& event) { event.signal(); }},
+                        {"reset", [](Koru::Event& event) { event.reset(); }},
+                        {"test", [](Koru::Event& event) { event.test(); }},
+                        {"wait", [](Koru::Event& event) { event.wait(0); }}};
+    for (Row const& row : rows) {
+        CAPTURE(row.label);
+        Koru::Event event(true);
+        std::atomic<bool> finished{false};
+        bool early = true;
+        std::thread other;
+        timedWait.answer = ETIMEDOUT;
+        timedWait.meanwhile = [&] {
+            other = std::thread([&] {
+                row.operation(event);
+                finished = true;
+            });
+            ::usleep(50000);
+            early = finished;
+        };
+        CHECK(event.wait(5) == 1);
+        timedWait = TimedWait();
+        other.join();
+        CHECK_FALSE(early);
+        CHECK(finished);
     }
-    thread.join();
-    CHECK(calls == 0);
+}
+
+TEST_CASE("a wait without limit does not use the timed wait") {
+    for (unsigned long const timeout : {0xFFFFFFFFUL, ULONG_MAX}) {
+        CAPTURE(timeout);
+        Koru::Event event(true);
+        int calls = -1;
+        std::atomic<bool> returned{false};
+        std::thread thread([&] {
+            event.wait(timeout);
+            calls = timedWait.calls;
+            returned = true;
+        });
+        while (!returned) {
+            event.signal();
+            ::usleep(1000);
+        }
+        thread.join();
+        CHECK(calls == 0);
+    }
 }
 
 // ================================================================================== cancellation

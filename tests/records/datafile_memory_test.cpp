@@ -1,0 +1,332 @@
+// The record file when memory runs out. A file of its own, since the operators that allocate memory
+// are replaced for the whole executable and the libraries it loaded.
+#include <doctest/doctest.h>
+
+#include <unistd.h>
+
+#include <atomic>
+#include <cstddef>
+#include <cstdlib>
+#include <memory>
+#include <new>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include <koru/datafile.h>
+
+#include "records/recordfixture.h"
+#include "support/subprocess.h"
+#include "support/throws.h"
+
+using Koru::DataFile;
+using test::checkSame;
+using test::checkSameRecords;
+using test::Entries;
+using test::Entry;
+using test::fileBytes;
+using test::held;
+using test::isFree;
+using test::READ;
+using test::READ_WRITE;
+using test::record;
+using test::RecordPlace;
+using test::WRITE;
+using Record = Koru::DataFile::Record;
+
+namespace {
+
+enum class Failing { ONE, ONE_AND_ALL_LATER };
+
+std::atomic<long> allocationsBeforeFailure{-1}; // -1: none fails
+std::atomic<bool> laterOnesFail{false};
+std::atomic<long> failures{0};
+
+void* _allocate(std::size_t size) noexcept {
+    if (allocationsBeforeFailure >= 0 && allocationsBeforeFailure-- == 0) {
+        ++failures;
+        if (laterOnesFail) allocationsBeforeFailure = 0;
+        return nullptr;
+    }
+    return std::malloc(size == 0 ? 1 : size);
+}
+
+void* _allocateOrThrow(std::size_t size) {
+    void* const memory = _allocate(size);
+    if (memory == nullptr) throw std::bad_alloc();
+    return memory;
+}
+
+/// Lets allocation number `before` (from 0) fail while the callable runs, and says how that ended:
+/// "done", "std::bad_alloc" or another exception's message.
+template <class Callable>
+std::string runOutOfMemory(long before, Failing failing, Callable callable) {
+    std::string outcome = "done"; // short enough to need no memory
+    failures = 0;
+    laterOnesFail = failing == Failing::ONE_AND_ALL_LATER;
+    allocationsBeforeFailure = before;
+    try {
+        callable();
+        allocationsBeforeFailure = -1;
+    } catch (std::bad_alloc const&) {
+        allocationsBeforeFailure = -1;
+        outcome = "std::bad_alloc";
+    } catch (std::exception const& e) {
+        allocationsBeforeFailure = -1;
+        outcome = e.what();
+    }
+    return outcome;
+}
+
+bool memoryRanOut() { return failures > 0; }
+
+/// Ends the process when a test hangs.
+class Watchdog {
+public:
+    Watchdog() { ::alarm(250); }
+    Watchdog(Watchdog const&) = delete;
+    Watchdog& operator=(Watchdog const&) = delete;
+    ~Watchdog() { ::alarm(0); }
+};
+
+} // namespace
+
+void* operator new(std::size_t size) { return _allocateOrThrow(size); }
+void* operator new[](std::size_t size) { return _allocateOrThrow(size); }
+void* operator new(std::size_t size, std::nothrow_t const&) noexcept { return _allocate(size); }
+void* operator new[](std::size_t size, std::nothrow_t const&) noexcept { return _allocate(size); }
+void operator delete(void* memory) noexcept { std::free(memory); }
+void operator delete[](void* memory) noexcept { std::free(memory); }
+void operator delete(void* memory, std::size_t) noexcept { std::free(memory); }
+void operator delete[](void* memory, std::size_t) noexcept { std::free(memory); }
+void operator delete(void* memory, std::nothrow_t const&) noexcept { std::free(memory); }
+void operator delete[](void* memory, std::nothrow_t const&) noexcept { std::free(memory); }
+
+namespace {
+
+/// Records stored in a file, and those that are inserted before it is written back.
+struct Edit {
+    std::string label;
+    Entries stored;
+    Entries inserted;
+};
+
+Entries numbered(std::wstring const& prefix, int count, std::size_t dataSize) {
+    Entries entries;
+    for (int i = 0; i < count; ++i) {
+        entries.push_back({prefix + std::to_wstring(i), test::Bytes(dataSize, 'd')});
+    }
+    return entries;
+}
+
+std::vector<Edit> edits() {
+    return {
+        {"nothing at all", {}, {}},
+        {"one record", numbered(L"k", 1, 4), {}},
+        {"one record more", numbered(L"k", 1, 4), numbered(L"l", 1, 100)},
+        {"long key and data", {}, {{std::wstring(50000, L'k'), test::Bytes(200000, 'd')}}},
+        {"many records", numbered(L"a somewhat long key ", 70, 30), numbered(L"k", 70, 3)},
+    };
+}
+
+void openAndEdit(DataFile& file, unsigned long mode, Edit const& edit) {
+    file.open(mode);
+    for (Entry const& e : edit.inserted) file.insert(Record(e.key, e.data));
+}
+
+/// Runs a write-back with each of its allocations failing in turn. The file on the disk is the old
+/// or the new one after each, whole, and the object can still be used.
+template <class WriteBack>
+void checkWriteBack(WriteBack writeBack, std::vector<unsigned long> const& modes) {
+    Watchdog const watchdog;
+    RecordPlace const place;
+    for (Edit const& edit : edits()) {
+        for (unsigned long const mode : modes) {
+            for (Failing const failing : {Failing::ONE, Failing::ONE_AND_ALL_LATER}) {
+                for (long before = 0;; ++before) {
+                    CAPTURE(edit.label);
+                    CAPTURE(mode);
+                    CAPTURE(failing == Failing::ONE);
+                    CAPTURE(before);
+                    place.write(fileBytes(edit.stored));
+                    DataFile file(place.path());
+                    openAndEdit(file, mode, edit);
+                    std::string const old = place.content();
+                    std::string const complete = fileBytes(held(file));
+                    std::string const outcome =
+                        runOutOfMemory(before, failing, [&] { writeBack(file); });
+                    REQUIRE(place.exists());
+                    bool const isOld = place.content() == old;
+                    bool const isNew = place.content() == complete;
+                    if (outcome == "done") {
+                        CHECK(isNew);
+                    } else {
+                        bool const oldOrNew = isOld || isNew;
+                        CHECK(oldOrNew);
+                        CHECK(outcome == "std::bad_alloc");
+                    }
+                    CHECK(isFree(file));
+                    if (!memoryRanOut()) break;
+                    CHECK(test::messageOf<std::exception>([&] { file.close(); }) == "<nothing>");
+                    CHECK(before < 10000);
+                }
+            }
+        }
+    }
+}
+
+} // namespace
+
+TEST_CASE("when memory runs out in close, the old file or the new one is there, and whole") {
+    checkWriteBack([](DataFile& file) { file.close(); }, {READ_WRITE, WRITE});
+}
+
+TEST_CASE("when memory runs out in synchronize, the old file or the new one is there, and whole") {
+    checkWriteBack([](DataFile& file) { file.synchronize(); }, {READ_WRITE});
+}
+
+TEST_CASE("when memory runs out before the old file is deleted, the records are still held") {
+    RecordPlace const place;
+    place.write(fileBytes(numbered(L"k", 70, 10)));
+    DataFile file(place.path());
+    file.open(READ_WRITE);
+    file.insert(record(L"new"));
+    Entries const entries = held(file);
+    std::string const outcome = runOutOfMemory(0, Failing::ONE, [&] { file.close(); });
+    REQUIRE(outcome == "std::bad_alloc");
+    CHECK(file.is_open());
+    checkSame(held(file), entries);
+    file.close();
+    CHECK(place.content() == fileBytes(entries));
+}
+
+TEST_CASE("when memory runs out in the destructor, the process goes on and no file is cut") {
+    RecordPlace const place;
+    for (Edit const& edit : edits()) {
+        for (Failing const failing : {Failing::ONE, Failing::ONE_AND_ALL_LATER}) {
+            for (long before = 0;; ++before) {
+                CAPTURE(edit.label);
+                CAPTURE(failing == Failing::ONE);
+                CAPTURE(before);
+                std::string const old = fileBytes(edit.stored);
+                place.write(old);
+                test::Outcome const outcome = test::inChild([&] {
+                    ::alarm(60);
+                    std::unique_ptr<DataFile> file(new DataFile(place.path()));
+                    openAndEdit(*file, READ_WRITE, edit);
+                    std::string const complete = fileBytes(held(*file));
+                    if (runOutOfMemory(before, failing, [&] { file.reset(); }) != "done") return 1;
+                    bool const ranOut = memoryRanOut();
+                    if (place.content() == complete) return ranOut ? 42 : 43;
+                    return place.content() == old && ranOut ? 42 : 2;
+                });
+                CHECK(outcome.signal == 0);
+                if (outcome.exitCode == 43) break;
+                REQUIRE(outcome.exitCode == 42);
+            }
+        }
+    }
+}
+
+TEST_CASE("when memory runs out in open, a later open works") {
+    Watchdog const watchdog;
+    RecordPlace const place;
+    for (Edit const& edit : edits()) {
+        std::string const content = fileBytes(edit.stored) + fileBytes(edit.inserted);
+        Entries const expected = test::load(content).entries;
+        for (unsigned long const mode : {READ, READ_WRITE}) {
+            for (Failing const failing : {Failing::ONE, Failing::ONE_AND_ALL_LATER}) {
+                for (long before = 0;; ++before) {
+                    CAPTURE(edit.label);
+                    CAPTURE(mode);
+                    CAPTURE(failing == Failing::ONE);
+                    CAPTURE(before);
+                    place.write(content);
+                    DataFile file(place.path());
+                    std::string const outcome =
+                        runOutOfMemory(before, failing, [&] { file.open(mode); });
+                    bool const ranOut = memoryRanOut();
+                    CHECK(isFree(file));
+                    if (outcome != "done") {
+                        CHECK(outcome == "std::bad_alloc");
+                        CHECK(file.size() <= expected.size());
+                        held(file); // whatever it is, it can be used
+                        file.setMode(READ);
+                        file.close();
+                        file.open(READ);
+                    }
+                    bool const same = place.content() == content;
+                    CHECK(same);
+                    checkSameRecords(held(file), expected);
+                    file.setMode(READ);
+                    if (!ranOut) break;
+                    CHECK(before < 100000);
+                }
+            }
+        }
+    }
+}
+
+TEST_CASE("when memory runs out in insert or remove, it is done whole or not at all") {
+    Watchdog const watchdog;
+    Record const longOne(std::wstring(500, L'\u00E9'), test::Bytes(500, 'x'));
+    for (int const size : {0, 1, 63, 64, 65, 127, 128, 129, 256}) {
+        for (bool const inserting : {true, false}) {
+            for (long before = 0;; ++before) {
+                CAPTURE(size);
+                CAPTURE(inserting);
+                CAPTURE(before);
+                DataFile file;
+                for (Entry const& e : numbered(L"k", size, 5)) file.insert(Record(e.key, e.data));
+                if (!inserting) file.insert(longOne);
+                unsigned long const count = file.size();
+                std::string const outcome = runOutOfMemory(before, Failing::ONE, [&] {
+                    inserting ? file.insert(longOne) : file.remove(longOne);
+                });
+                bool const ranOut = memoryRanOut();
+                CHECK(isFree(file));
+                if (outcome != "done") {
+                    CHECK(outcome == "std::bad_alloc");
+                    CHECK(file.size() == count);
+                    inserting ? file.insert(longOne) : file.remove(longOne);
+                }
+                Entries expected = numbered(L"k", size, 5);
+                if (inserting) expected.push_back(test::entryOf(longOne));
+                checkSameRecords(held(file), expected);
+                CHECK(test::isInOrderOfAddresses(file));
+                if (!ranOut) break;
+                CHECK(before < 100);
+            }
+        }
+    }
+}
+
+TEST_CASE("when memory runs out in setKey or setData, the record keeps a key and data of its own") {
+    std::wstring const key(500, L'k');
+    test::Bytes const data(500, 'd');
+    for (long before = 0;; ++before) {
+        Record r = record(L"before", "old");
+        std::string const outcome = runOutOfMemory(before, Failing::ONE, [&] { r.setKey(key); });
+        test::checkKey(r.getKey(), outcome == "done" ? key : L"before");
+        if (!memoryRanOut()) break;
+    }
+    for (long before = 0;; ++before) {
+        Record r = record(L"before", "old");
+        std::string const outcome = runOutOfMemory(before, Failing::ONE, [&] { r.setData(data); });
+        bool const right = r.getData() == (outcome == "done" ? data : test::bytes("old"));
+        CHECK(right);
+        if (!memoryRanOut()) break;
+    }
+}
+
+TEST_CASE("when memory runs out in the constructor, nothing is left behind") {
+    RecordPlace const place;
+    Koru::File::Path const path(place.path());
+    for (long before = 0;; ++before) {
+        std::string const outcome =
+            runOutOfMemory(before, Failing::ONE, [&] { DataFile const file(path); });
+        CHECK(outcome == (memoryRanOut() ? "std::bad_alloc" : "done"));
+        if (!memoryRanOut()) break;
+    }
+    CHECK(!place.exists());
+}

@@ -1,0 +1,238 @@
+// A record file in a directory of its own, the records as plain values, and what reading and
+// writing them does, in the plainest way. Tests compare the library with it.
+#ifndef KORU_TESTS_RECORDFIXTURE_H
+#define KORU_TESTS_RECORDFIXTURE_H
+
+#include <doctest/doctest.h>
+
+#include <pthread.h>
+#include <wchar.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <filesystem>
+#include <functional>
+#include <future>
+#include <stdexcept>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <koru/datafile.h>
+
+#include "support/tempdir.h"
+
+namespace test {
+
+unsigned long const READ = Koru::File::READ;
+unsigned long const WRITE = Koru::File::WRITE;
+unsigned long const BINARY = Koru::File::BINARY;
+unsigned long const READ_WRITE = Koru::File::READ | Koru::File::WRITE;
+
+using Bytes = std::vector<unsigned char>;
+
+inline Bytes bytes(std::string const& text) { return {text.begin(), text.end()}; }
+
+/// A record as a plain value.
+struct Entry {
+    std::wstring key;
+    Bytes data;
+};
+
+inline bool operator==(Entry const& a, Entry const& b) {
+    return a.key == b.key && a.data == b.data;
+}
+inline bool operator<(Entry const& a, Entry const& b) {
+    return a.key != b.key ? a.key < b.key : a.data < b.data;
+}
+
+using Entries = std::vector<Entry>;
+
+inline Koru::DataFile::Record record(std::wstring const& key, std::string const& data = "") {
+    return {key, bytes(data)};
+}
+
+// --------------------------------------------------------------------------------- what is
+// expected
+
+/// Whether keys are equal: as the C library compares them, up to the first NUL.
+inline bool sameKey(std::wstring const& a, std::wstring const& b) {
+    return ::wcscasecmp(a.c_str(), b.c_str()) == 0;
+}
+
+/// The key that setting this one stores.
+/// @throws std::invalid_argument for a key that is refused
+inline std::wstring storedKey(std::wstring key) {
+    wchar_t const* const blanks = L" \t\n";
+    std::size_t const first = key.find_first_not_of(blanks);
+    if (first != std::wstring::npos) key.erase(0, first);
+    std::size_t const last = key.find_last_not_of(blanks);
+    if (last != std::wstring::npos) key.erase(last + 1);
+    if (key.empty() || key[0] == L'\0') throw std::invalid_argument("zero length key");
+    return key;
+}
+
+/// A length field.
+inline std::string lengthField(std::uint32_t length) {
+    std::string field;
+    for (int shift = 0; shift < 32; shift += 8) field += static_cast<char>(length >> shift & 0xFFU);
+    return field;
+}
+
+inline std::string fileBytes(Entry const& entry) {
+    std::string result = lengthField(static_cast<std::uint32_t>(2 * entry.key.size()));
+    for (wchar_t const c : entry.key) {
+        result += '\0';
+        result += static_cast<char>(static_cast<std::uint32_t>(c) & 0xFFU);
+    }
+    result += lengthField(static_cast<std::uint32_t>(entry.data.size()));
+    result.append(entry.data.begin(), entry.data.end());
+    return result;
+}
+
+inline std::string fileBytes(Entries const& entries) {
+    std::string result;
+    for (Entry const& entry : entries) result += fileBytes(entry);
+    return result;
+}
+
+/// How reading a file ends ("<nothing>" is thrown where all is well), and what is held then.
+struct Loaded {
+    std::string message;
+    Entries entries;
+};
+
+/// Cuts a length and as many bytes off the front.
+inline std::string cutField(std::string& rest) {
+    if (rest.size() < 4) throw std::runtime_error("failed to read from file");
+    std::uint32_t length = 0;
+    for (std::size_t i = 4; i-- > 0;) length = length << 8 | static_cast<unsigned char>(rest[i]);
+    if (rest.size() - 4 < length) throw std::runtime_error("failed to read from file");
+    std::string const field = rest.substr(4, length);
+    rest.erase(0, 4 + std::size_t{length});
+    return field;
+}
+
+/// What a file of these bytes is read as.
+inline Loaded load(std::string rest) {
+    Loaded result{"<nothing>", {}};
+    try {
+        while (!rest.empty()) {
+            std::string keyField = cutField(rest);
+            if (keyField.size() % 2 != 0) keyField += '\0';
+            std::wstring key;
+            for (std::size_t i = 1; i < keyField.size(); i += 2) {
+                key += static_cast<wchar_t>(static_cast<signed char>(keyField[i]));
+            }
+            Bytes const data = bytes(cutField(rest));
+            result.entries.push_back({storedKey(key), data});
+        }
+    } catch (std::exception const& e) {
+        result.message = e.what();
+    }
+    return result;
+}
+
+// -------------------------------------------------------------------------------- what there is
+
+/// A record file's place, without the file at first.
+class RecordPlace {
+public:
+    std::string const& path() const { return path_; }
+    TempDir const& directory() const { return directory_; }
+    void write(std::string const& content) const {
+        std::filesystem::remove(path_);
+        writeFile(path_, content);
+    }
+    std::string content() const { return readFile(path_); }
+    bool exists() const { return std::filesystem::exists(path_); }
+
+private:
+    TempDir directory_;
+    std::string path_ = directory_ / "records.dat";
+};
+
+inline Entry entryOf(Koru::DataFile::Record const& held) { return {held.getKey(), held.getData()}; }
+
+/// The records held, by position.
+inline Entries held(Koru::DataFile& file) {
+    Entries entries;
+    for (unsigned long i = 0; i < file.size(); ++i) entries.push_back(entryOf(file[i]));
+    return entries;
+}
+
+inline Entries sorted(Entries entries) {
+    std::sort(entries.begin(), entries.end());
+    return entries;
+}
+
+/// Text and bytes for a test's output: what is not printable as a number in hexadecimal.
+template <class Text>
+std::string shownText(Text const& text) {
+    static char const digits[] = "0123456789abcdef";
+    std::string result;
+    std::size_t shownSoFar = 0;
+    for (auto const c : text) {
+        if (++shownSoFar > 100) return result + "... of " + std::to_string(text.size());
+        auto const number = static_cast<std::uint32_t>(c);
+        if (number >= 0x20 && number < 0x7F && number != '<') {
+            result += static_cast<char>(number);
+            continue;
+        }
+        result += '<';
+        for (int shift = number > 0xFF ? 28 : 4; shift >= 0; shift -= 4) {
+            result += digits[number >> shift & 15U];
+        }
+        result += '>';
+    }
+    return result;
+}
+
+inline std::string shown(Entries const& entries) {
+    std::string result;
+    for (std::size_t i = 0; i < entries.size() && i < 50; ++i) {
+        result += shownText(entries[i].key) + ": " + shownText(entries[i].data) + '\n';
+    }
+    return result;
+}
+
+/// Both are the same in the same order, shown when not.
+inline void checkSame(Entries const& actual, Entries const& expected) {
+    bool const same = actual == expected;
+    INFO("actual:\n", shown(actual), "expected:\n", shown(expected));
+    CHECK(same);
+}
+
+/// Both are the same in any order: positions have no meaning after reading.
+inline void checkSameRecords(Entries const& actual, Entries const& expected) {
+    checkSame(sorted(actual), sorted(expected));
+}
+
+inline void checkKey(std::wstring const& actual, std::wstring const& expected) {
+    CHECK(shownText(actual) == shownText(expected));
+}
+
+/// Positions follow the addresses of the records.
+inline bool isInOrderOfAddresses(Koru::DataFile& file) {
+    for (unsigned long i = 1; i < file.size(); ++i) {
+        if (!std::less<>()(&file[i - 1], &file[i])) return false;
+    }
+    return true;
+}
+
+/// Whether nobody, the calling thread included, holds the file's lock.
+inline bool isFree(Koru::File& file) {
+    std::promise<bool> promise;
+    std::future<bool> result = promise.get_future();
+    std::thread other([&] { promise.set_value(file.lock() && file.unlock()); });
+    bool const finished = result.wait_for(std::chrono::seconds(20)) == std::future_status::ready;
+    if (!finished) ::pthread_cancel(other.native_handle());
+    other.join();
+    return finished && result.get();
+}
+
+} // namespace test
+
+#endif
