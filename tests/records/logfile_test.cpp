@@ -232,7 +232,7 @@ TEST_CASE("nothing is added to what the caller writes") {
     LogPlace const place;
     std::string all;
     for (int i = 0; i < 256; ++i) all += static_cast<char>(i);
-    std::string const longLine(3 * LogFile::MAX_LINE_LENGTH, 'l'); // no limit is imposed
+    std::string const longLine(3UL * LogFile::MAX_LINE_LENGTH, 'l'); // no limit is imposed
     LogFile log(place.path());
     log.open(WRITE);
     log.close();
@@ -387,9 +387,9 @@ TEST_CASE("the library's inserters write to a log") {
     Koru::operator<<(log, L"wide \u00E9"s) << '\n';
     Koru::operator<<(log, std::string(300, 'n')) << '\n'; // counted with 8 bits
     Koru::operator<<(log, File::Path("/dir/name")) << std::endl;
-    log << "number " << 42 << ' ' << std::hex << 255 << '\n';
+    log << 42 << ' ' << std::hex << 255 << '\n';
     log.close();
-    CHECK(place.content() == "wide \xE9\n" + std::string(44, 'n') + "\n/dir/name\nnumber 42 ff\n");
+    CHECK(place.content() == "wide \xE9\n" + std::string(44, 'n') + "\n/dir/name\n42 ff\n");
 }
 
 // ------------------------------------------------------------------------------ what goes wrong
