@@ -10,7 +10,9 @@ namespace Koru {
 
 /// A file opened so that every write goes to its end, also when other processes append to it. What
 /// a line looks like is the caller's business: write to the object as to any stream. Lines of
-/// several processes stay whole when each is flushed at its end and fits the stream's buffer.
+/// several processes stay whole when each is flushed at its end and fits the stream's buffer. The
+/// file should exist before several processes open it: of two that find it missing at once, the
+/// later empties it.
 ///
 /// Intended: while the log is open its mode is 0. So `synchronize` closes it and then fails with
 /// "failed to open file.".
