@@ -61,7 +61,8 @@ public:
     /// destroys the records and closes the file. Without `WRITE` changes are lost silently.
     /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
     ///         written, the records are held
-    /// @throws std::runtime_error "failed to open file."; the old file is gone then, the mode 0, the
+    /// @throws std::runtime_error "failed to open file."; the old file is gone then, the mode 0,
+    /// the
     ///         records are held: `setMode` and another `close` try again
     /// @throws std::runtime_error "failed to close file."
     void close() override;

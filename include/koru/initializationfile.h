@@ -65,7 +65,8 @@ public:
     /// empties the table and closes the file. Without `WRITE` changes are lost silently.
     /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
     ///         written, the table intact
-    /// @throws std::runtime_error "failed to open file."; the old file is gone then, the mode 0, the
+    /// @throws std::runtime_error "failed to open file."; the old file is gone then, the mode 0,
+    /// the
     ///         table intact: `setMode` and another `close` try again
     /// @throws std::runtime_error "failed to close file."
     void close() override;

@@ -1,5 +1,5 @@
 /// @file
-/// Questions about the running process.
+/// Questions about the host and the running process, and operations on whole files.
 #ifndef KORU_SYSTEM_H
 #define KORU_SYSTEM_H
 
@@ -23,6 +23,39 @@ public:
     /// the result is what `realpath` (POSIX) leaves behind: with glibc the path up to and including
     /// the first missing component.
     static std::wstring getProcessFileName();
+
+    /// The platform's type: always 0 here.
+    static int getType();
+
+    /// The platform's version: always empty here.
+    static std::wstring getVersion();
+
+    /// @name The host
+    /// Each is empty where the system does not tell. Names are looked up with `gethostbyname`
+    /// (POSIX.1-2001), which shares static storage: the last two are not called from several
+    /// threads at once without a lock.
+    /// @{
+
+    /// The host's name (`gethostname`), up to 128 bytes.
+    static std::wstring getName();
+
+    /// The host's official name, as the resolver gives it.
+    static std::wstring getIpHostName();
+
+    /// The host's first IPv4 address, as in 127.0.0.1.
+    static std::wstring getIpAddress();
+
+    /// @}
+
+    /// @name Files
+    /// The operations of `File` under other names.
+    /// @{
+    static bool existsFile(std::wstring const& path);                         ///< File::exists
+    static bool renameFile(std::wstring const& from, std::wstring const& to); ///< File::rename
+    static bool deleteFile(std::wstring const& path);                         ///< File::remove
+    static bool copyFile(std::wstring const& from, std::wstring const& to);   ///< File::copy
+    static bool createFile(std::wstring const& path);                         ///< File::create
+    /// @}
 };
 
 } // namespace Koru

@@ -1,6 +1,5 @@
 #include <koru/string.h>
 
-#include <cxxabi.h>
 #include <strings.h>
 
 #include <algorithm>
@@ -11,6 +10,7 @@
 
 #include "text/convert.h"
 #include "text/fold.h"
+#include "text/insert.h"
 #include "text/simd.h"
 #include "text/utf8.h"
 
@@ -145,63 +145,13 @@ char* encode(wchar_t const* s, std::size_t size, char* to) {
     return to;
 }
 
-namespace {
-
-/// Whether inserting characters one by one comes down to handing each to the stream's buffer: a
-/// width pads the first one, unitbuf flushes each, a tied stream is flushed before each.
-inline bool _passesThrough(std::ostream const& os) {
-    return os.good() && os.width() == 0 && (os.flags() & std::ios::unitbuf) == 0 &&
-           os.tie() == nullptr;
-}
-
-/// Notes that the buffer threw, as formatted output does: without an exception of the stream's own.
-void _setBad(std::ostream& os) {
-    try {
-        os.setstate(std::ios::badbit);
-    } catch (std::ios::failure const&) { // The buffer's exception takes its place.
-    }
-}
-
-/// Hands the characters up to `last` and that one to the buffer, at once but with the outcome of
-/// one by one: the first that fails makes the stream bad, and the next after that makes it fail.
-/// The unwinding of a cancelled thread carries no object, which the sanitizer takes for a null
-/// reference.
-__attribute__((no_sanitize("null"))) void _passThrough(std::ostream& os, char const* s,
-                                                       char const* last) {
-    bool onlyLast = false;
-    try {
-        onlyLast = os.rdbuf()->sputn(s, last - s) == last - s;
-        if (onlyLast && os.rdbuf()->sputc(*last) != std::char_traits<char>::eof()) return;
-        os.setstate(std::ios::badbit);
-    } catch (abi::__forced_unwind const&) {
-        _setBad(os);
-        throw;
-    } catch (...) {
-        _setBad(os);
-        if ((os.exceptions() & std::ios::badbit) != 0) throw;
-    }
-    if (!onlyLast) os.setstate(std::ios::failbit);
-}
-
-/// Inserts characters, at least one, as formatted output.
-inline void _insert(std::ostream& os, char const* s, std::size_t size) {
-    char const* const last = s + size - 1;
-    if (_passesThrough(os)) {
-        _passThrough(os, s, last);
-        return;
-    }
-    for (; s <= last; ++s) os << *s;
-}
-
-} // namespace
-
 std::ostream& operator<<(std::ostream& os, std::wstring const& s) {
     char block[BLOCK];
     for (std::size_t done = 0; done != s.size();) {
         std::size_t const size = std::min(s.size() - done, BLOCK);
         std::transform(s.data() + done, s.data() + done + size, block,
                        [](wchar_t c) { return static_cast<char>(c); });
-        _insert(os, block, size);
+        insert(os, block, size);
         done += size;
     }
     return os;
@@ -210,7 +160,7 @@ std::ostream& operator<<(std::ostream& os, std::wstring const& s) {
 std::ostream& operator<<(std::ostream& os, std::string const& s) {
     // Intended: an 8-bit signed count.
     auto const count = static_cast<std::int8_t>(s.size() & 0xFF);
-    if (count > 0) _insert(os, s.data(), static_cast<std::size_t>(count));
+    if (count > 0) insert(os, s.data(), static_cast<std::size_t>(count));
     return os;
 }
 

@@ -1,0 +1,73 @@
+#include <koru/system.h>
+
+#include <arpa/inet.h>
+#include <netdb.h>
+#include <unistd.h>
+
+#include <array>
+#include <cstring>
+
+#include <koru/file.h>
+#include <koru/string.h>
+
+namespace Koru {
+
+namespace {
+
+constexpr std::size_t NAME_SIZE = 128;
+
+/// The host's name with a zero byte behind it, also when it fills all bytes; empty on failure.
+class HostName {
+public:
+    HostName() : bytes_() {
+        if (::gethostname(bytes_.data(), NAME_SIZE) != 0) bytes_[0] = '\0';
+    }
+
+    bool isKnown() const { return bytes_[0] != '\0'; }
+    char const* bytes() const { return bytes_.data(); }
+
+    /// What the resolver knows of it, in static storage; null when that is nothing.
+    hostent const* entry() const { return isKnown() ? ::gethostbyname(bytes()) : nullptr; }
+
+private:
+    std::array<char, NAME_SIZE + 1> bytes_;
+};
+
+} // namespace
+
+int System::getType() { return 0; }
+
+std::wstring System::getVersion() { return std::wstring(); }
+
+std::wstring System::getName() { return make_wstring(HostName().bytes()); }
+
+std::wstring System::getIpHostName() {
+    HostName const name;
+    hostent const* const entry = name.entry();
+    return entry == nullptr ? std::wstring() : make_wstring(entry->h_name);
+}
+
+std::wstring System::getIpAddress() {
+    HostName const name;
+    hostent const* const entry = name.entry();
+    if (entry == nullptr || entry->h_addr_list[0] == nullptr) return std::wstring();
+    in_addr address;
+    std::memcpy(&address, entry->h_addr_list[0], sizeof address);
+    return make_wstring(::inet_ntoa(address));
+}
+
+bool System::existsFile(std::wstring const& path) { return File::exists(path); }
+
+bool System::renameFile(std::wstring const& from, std::wstring const& to) {
+    return File::rename(from, to);
+}
+
+bool System::deleteFile(std::wstring const& path) { return File::remove(path); }
+
+bool System::copyFile(std::wstring const& from, std::wstring const& to) {
+    return File::copy(from, to);
+}
+
+bool System::createFile(std::wstring const& path) { return File::create(path); }
+
+} // namespace Koru

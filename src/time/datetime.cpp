@@ -1,0 +1,297 @@
+#include <koru/datetime.h>
+
+#include <cstdlib>
+#include <ostream>
+#include <stdexcept>
+
+#include "text/insert.h"
+
+namespace Koru {
+
+// For callers who take their addresses; the values stand in the header.
+unsigned int const DateTime::DATE;
+unsigned int const DateTime::TIME;
+
+namespace {
+
+constexpr int SECONDS_PER_HOUR = 3600;
+
+/// The offset of the local zone at a moment, east of UTC, in whole hours. gmtime leaves tm_isdst 0:
+/// the hour of daylight saving is not in it.
+std::int16_t _offsetHours(std::time_t moment) {
+    std::tm* const utc = std::gmtime(&moment);
+    if (utc == nullptr) return 0;
+    // As 64 bits, since at the edges of time_t mktime may fail and the difference not fit.
+    std::int64_t const difference = std::int64_t{moment} - std::int64_t{std::mktime(utc)};
+    return static_cast<std::int16_t>(difference / SECONDS_PER_HOUR);
+}
+
+std::tm const& _localTime(long seconds) {
+    std::time_t const moment = seconds;
+    std::tm const* const local = std::localtime(&moment);
+    if (local == nullptr) throw std::invalid_argument("t is too small.");
+    return *local;
+}
+
+bool _has(std::string const& text, std::size_t position, char c) {
+    return position < text.size() && text[position] == c;
+}
+
+bool _isDigit(char c) { return c >= '0' && c <= '9'; }
+
+/// The number that strtol finds in part of a text, which goes up to that position at least.
+long _number(std::string const& text, std::size_t position, std::size_t size) {
+    long number = 0;
+    for (std::size_t i = position; i < position + size; ++i) {
+        // Signs, blanks and missing digits are left to strtol.
+        if (i >= text.size() || !_isDigit(text[i])) {
+            return std::strtol(text.substr(position, size).c_str(), nullptr, 10);
+        }
+        number = 10 * number + (text[i] - '0');
+    }
+    return number;
+}
+
+void _check(bool inRange, char const* message) {
+    if (!inRange) throw std::invalid_argument(message);
+}
+
+/// Writes a number with leading zeros; a wider one is not cut.
+char* _put(char* to, unsigned int number, unsigned int width) {
+    unsigned int digits = width;
+    for (unsigned int rest = number / (width == 4 ? 10000U : 100U); rest != 0; rest /= 10) ++digits;
+    for (unsigned int i = digits; i-- != 0; number /= 10)
+        to[i] = static_cast<char>('0' + number % 10);
+    return to + digits;
+}
+
+char* _put(char* to, char c) {
+    *to = c;
+    return to + 1;
+}
+
+constexpr std::size_t LONGEST_TEXT = sizeof "65535-255-255 255:255:255";
+
+} // namespace
+
+DateTime::DateTime()
+    : year_(0), month_(0), day_(0), hour_(0), minute_(0), second_(0), millisecond_(0), offset_(0),
+      parts_(DATE | TIME) {}
+
+DateTime::DateTime(std::tm const& time, unsigned int parts) : DateTime() {
+    takeFields(time, parts);
+}
+
+DateTime::DateTime(long seconds, unsigned int parts) : DateTime() {
+    takeFields(_localTime(seconds), parts);
+}
+
+DateTime::DateTime(timeval const& time, unsigned int parts)
+    : DateTime(static_cast<long>(time.tv_sec), parts) {
+    millisecond_ = static_cast<std::uint32_t>(time.tv_usec / 1000);
+}
+
+DateTime::DateTime(std::string const& text, unsigned int parts) : DateTime() {
+    if ((parts & DATE) != 0) readDate(text);
+    if ((parts & TIME) != 0) readTime(text);
+    parts_ = static_cast<std::uint8_t>(parts);
+}
+
+void DateTime::takeFields(std::tm const& time, unsigned int parts) {
+    std::tm copy = time;
+    if ((parts & DATE) != 0) {
+        year_ = static_cast<std::uint16_t>(static_cast<unsigned int>(time.tm_year) + 1900U);
+        month_ = static_cast<std::uint8_t>(static_cast<unsigned int>(time.tm_mon) + 1U);
+        day_ = static_cast<std::uint8_t>(time.tm_mday);
+    }
+    if ((parts & TIME) != 0) {
+        hour_ = static_cast<std::uint8_t>(time.tm_hour);
+        minute_ = static_cast<std::uint8_t>(time.tm_min);
+        second_ = static_cast<std::uint8_t>(time.tm_sec);
+    }
+    // The time may stand in the storage that the calls below share: it is not looked at any more.
+    std::time_t const moment = std::mktime(&copy);
+    if ((parts & TIME) != 0) offset_ = _offsetHours(moment);
+    parts_ = static_cast<std::uint8_t>(parts);
+}
+
+void DateTime::readDate(std::string const& text) {
+    _check(_has(text, 4, '-') && _has(text, 7, '-'), "incorrect format.");
+    // Intended: a number of 0 is skipped.
+    if (long const year = _number(text, 0, 4)) setYear(static_cast<unsigned short>(year));
+    if (long const month = _number(text, 5, 2)) setMonth(static_cast<unsigned char>(month));
+    if (long const day = _number(text, 8, 2)) setDay(static_cast<unsigned char>(day));
+}
+
+void DateTime::readTime(std::string const& text) {
+    std::size_t start = 0;
+    if (!_has(text, 2, ':') || !_has(text, 5, ':')) {
+        start = 11;
+        _check(_has(text, 13, ':') && _has(text, 16, ':'), "incorrect format.");
+    }
+    setHour(static_cast<unsigned char>(_number(text, start, 2)));
+    setMinute(static_cast<unsigned char>(_number(text, start + 3, 2)));
+    setSecond(static_cast<unsigned char>(_number(text, start + 6, 2)));
+}
+
+std::uint16_t DateTime::getYear() const { return year_; }
+
+std::uint8_t DateTime::getMonth() const { return month_; }
+
+std::uint8_t DateTime::getDay() const { return day_; }
+
+std::uint8_t DateTime::getHour() const { return hour_; }
+
+std::uint8_t DateTime::getMinute() const { return minute_; }
+
+std::uint8_t DateTime::getSecond() const { return second_; }
+
+std::uint32_t DateTime::getMillisecond() const { return millisecond_; }
+
+std::int16_t DateTime::getOffset() const { return offset_; }
+
+void DateTime::setYear(unsigned short year) {
+    _check(year >= 1000 && year <= 3000, "year out-of-range");
+    year_ = year;
+}
+
+void DateTime::setMonth(unsigned char month) {
+    _check(month >= 1 && month <= 12, "month out-of-range.");
+    month_ = month;
+}
+
+void DateTime::setDay(unsigned char day) {
+    _check(day >= 1 && day <= 31, "day out-of-range.");
+    day_ = day;
+}
+
+void DateTime::setHour(unsigned char hour) {
+    _check(hour <= 23, "hour out-of-range.");
+    hour_ = hour;
+}
+
+void DateTime::setMinute(unsigned char minute) {
+    _check(minute <= 59, "minute out-of-range.");
+    minute_ = minute;
+}
+
+void DateTime::setSecond(unsigned char second) {
+    _check(second <= 59, "minute out-of-range."); // Intended: the minute's message.
+    second_ = second;
+}
+
+void DateTime::setMillisecond(unsigned int millisecond) { millisecond_ = millisecond; }
+
+void DateTime::setOffset(short offset) {
+    _check(offset >= -720 && offset <= 840, "offset out-of-range.");
+    offset_ = offset;
+}
+
+void DateTime::clear(unsigned int parts) {
+    if ((parts & DATE) != 0) {
+        year_ = 0;
+        month_ = 0;
+        day_ = 0;
+    }
+    if ((parts & TIME) != 0) {
+        hour_ = 0;
+        minute_ = 0;
+        second_ = 0;
+        millisecond_ = 0;
+        offset_ = 0;
+    }
+}
+
+DateTime::operator long() const {
+    std::tm time{};
+    time.tm_sec = second_;
+    time.tm_min = minute_;
+    time.tm_hour = hour_;
+    time.tm_mday = day_;
+    time.tm_isdst = -1;
+    if (year_ != 0) time.tm_year = year_ - 1900;
+    if (month_ != 0) time.tm_mon = month_ - 1;
+    return static_cast<long>(std::mktime(&time));
+}
+
+DateTime::operator std::string() const {
+    char text[LONGEST_TEXT];
+    return std::string(text, format(text));
+}
+
+char* DateTime::format(char* to) const {
+    if ((parts_ & DATE) != 0) {
+        to = _put(_put(to, year_, 4), '-');
+        to = _put(_put(to, month_, 2), '-');
+        to = _put(to, day_, 2);
+    }
+    if ((parts_ & (DATE | TIME)) == (DATE | TIME)) to = _put(to, ' ');
+    if ((parts_ & TIME) != 0) {
+        to = _put(_put(to, hour_, 2), ':');
+        to = _put(_put(to, minute_, 2), ':');
+        to = _put(to, second_, 2);
+    }
+    return to;
+}
+
+std::ostream& operator<<(std::ostream& os, DateTime const& value) {
+    char text[LONGEST_TEXT];
+    insert(os, text, static_cast<std::size_t>(value.format(text) - text));
+    return os;
+}
+
+/// How two values compare: by their epoch seconds, which take a conversion of each unless the
+/// fields decide beyond doubt.
+class DateTime::Order {
+public:
+    Order(DateTime const& a, DateTime const& b) {
+        if (a.hasFieldsOf(b)) return;
+        if (a.hasRegularFields() && b.hasRegularFields()) {
+            difference_ = _days(a) - _days(b);
+            // No zone ever shifted by more than two days, and a day beyond the end of its month is
+            // three days later at the most.
+            constexpr int beyondDoubt = 7;
+            if (difference_ >= beyondDoubt || difference_ <= -beyondDoubt) return;
+        }
+        long const secondsA = a;
+        long const secondsB = b;
+        difference_ = secondsA < secondsB ? -1 : secondsA > secondsB;
+    }
+
+    bool isEqual() const { return difference_ == 0; }
+    bool isLess() const { return difference_ < 0; }
+
+private:
+    /// Days as if every month had 31.
+    static int _days(DateTime const& value) {
+        return (value.year_ * 12 + value.month_) * 31 + value.day_;
+    }
+
+    int difference_ = 0;
+};
+
+/// Whether the fields that a conversion looks at are the same.
+bool DateTime::hasFieldsOf(DateTime const& other) const {
+    return year_ == other.year_ && month_ == other.month_ && day_ == other.day_ &&
+           hour_ == other.hour_ && minute_ == other.minute_ && second_ == other.second_;
+}
+
+/// Whether the fields are a date and time that every time_t holds, in every zone.
+bool DateTime::hasRegularFields() const {
+    return year_ > 1902 && year_ < 2037 && month_ >= 1 && month_ <= 12 && day_ >= 1 && day_ <= 31 &&
+           hour_ <= 23 && minute_ <= 59 && second_ <= 59;
+}
+
+bool operator==(DateTime const& a, DateTime const& b) { return DateTime::Order(a, b).isEqual(); }
+
+bool operator!=(DateTime const& a, DateTime const& b) { return !(a == b); }
+
+bool operator<(DateTime const& a, DateTime const& b) { return DateTime::Order(a, b).isLess(); }
+
+bool operator<=(DateTime const& a, DateTime const& b) { return !(b < a); }
+
+bool operator>(DateTime const& a, DateTime const& b) { return b < a; }
+
+bool operator>=(DateTime const& a, DateTime const& b) { return !(a < b); }
+
+} // namespace Koru
