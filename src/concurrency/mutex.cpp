@@ -35,12 +35,22 @@ Mutex& Mutex::operator=(Mutex const& other) {
 
 Mutex::~Mutex() { ::pthread_mutex_destroy(&mutex_); }
 
-void Mutex::lock(unsigned long timeout) {
-    for (unsigned long tries = 0; tries < timeout; ++tries) {
-        if (::pthread_mutex_trylock(&mutex_) == 0) return;
+namespace {
+
+/// Goes on after a first try that failed. Intended: the last try, too, is followed by its sleep.
+void _poll(pthread_mutex_t& mutex, unsigned long timeout) {
+    for (unsigned long tries = 0; tries < timeout;) {
         ::usleep(POLL_INTERVAL);
+        if (++tries < timeout && ::pthread_mutex_trylock(&mutex) == 0) return;
     }
     throw std::runtime_error("failed to obtain mutex within timeout");
+}
+
+} // namespace
+
+void Mutex::lock(unsigned long timeout) {
+    bool const taken = timeout != 0 && ::pthread_mutex_trylock(&mutex_) == 0;
+    if (!taken) _poll(mutex_, timeout);
 }
 
 // The only failure is that the caller does not hold the mutex; there is nothing to give back then.

@@ -19,18 +19,18 @@ constexpr std::size_t NAME_SIZE = 128;
 /// The host's name with a zero byte behind it, also when it fills all bytes; empty on failure.
 class HostName {
 public:
-    HostName() : bytes_() {
-        if (::gethostname(bytes_.data(), NAME_SIZE) != 0) bytes_[0] = '\0';
+    HostName() : bytes_(), known_(::gethostname(bytes_.data(), NAME_SIZE) == 0) {
+        if (!known_) bytes_[0] = '\0';
     }
 
-    bool isKnown() const { return bytes_[0] != '\0'; }
     char const* bytes() const { return bytes_.data(); }
 
     /// What the resolver knows of it, in static storage; null when that is nothing.
-    hostent const* entry() const { return isKnown() ? ::gethostbyname(bytes()) : nullptr; }
+    hostent const* entry() const { return known_ ? ::gethostbyname(bytes()) : nullptr; }
 
 private:
     std::array<char, NAME_SIZE + 1> bytes_;
+    bool known_;
 };
 
 } // namespace

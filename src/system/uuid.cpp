@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <cstddef>
+#include <cstdint>
 #include <cstring>
 #include <ostream>
 
@@ -19,13 +20,20 @@ constexpr char DIGITS[] = "0123456789abcdef";
 
 using Text = std::array<char, TEXT_SIZE>;
 
-/// The value of a hexadecimal digit, or -1.
-int _digit(char c) {
-    if (c >= '0' && c <= '9') return c - '0';
-    if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-    if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-    return -1;
+constexpr std::uint8_t NO_DIGIT = 0xFF;
+
+constexpr std::array<std::uint8_t, 256> _makeValues() {
+    std::array<std::uint8_t, 256> values{};
+    for (auto& value : values) value = NO_DIGIT;
+    for (std::uint8_t i = 0; i < 10; ++i) values['0' + i] = i;
+    for (std::uint8_t i = 0; i < 6; ++i) {
+        values['a' + i] = values['A' + i] = static_cast<std::uint8_t>(10 + i);
+    }
+    return values;
 }
+
+/// The value of every hexadecimal digit.
+constexpr std::array<std::uint8_t, 256> VALUES = _makeValues();
 
 Text _format(unsigned char const (&bytes)[16]) {
     Text text;
@@ -54,9 +62,13 @@ Uuid::Uuid(std::string const& text) : bytes_() {
     std::copy_n(text.data(), TEXT_SIZE, digits.data());
     // Intended: hyphens anywhere. The last places keep what stood there and have to be digits too.
     static_cast<void>(std::remove(digits.begin(), digits.end(), '-'));
-    std::array<int, TEXT_SIZE> values;
-    std::transform(digits.begin(), digits.end(), values.begin(), _digit);
-    if (*std::min_element(values.begin(), values.end()) < 0) return;
+    std::array<std::uint8_t, TEXT_SIZE> values;
+    std::uint8_t all = 0;
+    for (std::size_t i = 0; i < TEXT_SIZE; ++i) {
+        values[i] = VALUES[static_cast<unsigned char>(digits[i])];
+        all |= values[i];
+    }
+    if (all == NO_DIGIT) return;
     for (std::size_t i = 0; i < 16; ++i) {
         bytes_[i] = static_cast<unsigned char>(values[2 * i] << 4 | values[2 * i + 1]);
     }

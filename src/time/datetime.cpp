@@ -40,16 +40,20 @@ bool _has(std::string const& text, std::size_t position, char c) {
 bool _isDigit(char c) { return c >= '0' && c <= '9'; }
 
 /// The number that strtol finds in part of a text, which goes up to that position at least.
-long _number(std::string const& text, std::size_t position, std::size_t size) {
-    long number = 0;
-    for (std::size_t i = position; i < position + size; ++i) {
-        // Signs, blanks and missing digits are left to strtol.
-        if (i >= text.size() || !_isDigit(text[i])) {
-            return std::strtol(text.substr(position, size).c_str(), nullptr, 10);
+template <std::size_t size>
+inline long _number(std::string const& text, std::size_t position) {
+    if (position + size <= text.size()) {
+        char const* const digits = text.data() + position;
+        long number = 0;
+        bool plain = true;
+        for (std::size_t i = 0; i < size; ++i) {
+            plain &= _isDigit(digits[i]);
+            number = 10 * number + (digits[i] - '0');
         }
-        number = 10 * number + (text[i] - '0');
+        if (plain) return number;
     }
-    return number;
+    // Signs, blanks and missing digits are left to it.
+    return std::strtol(text.substr(position, size).c_str(), nullptr, 10);
 }
 
 void _check(bool inRange, char const* message) {
@@ -118,9 +122,9 @@ void DateTime::takeFields(std::tm const& time, unsigned int parts) {
 void DateTime::readDate(std::string const& text) {
     _check(_has(text, 4, '-') && _has(text, 7, '-'), "incorrect format.");
     // Intended: a number of 0 is skipped.
-    if (long const year = _number(text, 0, 4)) setYear(static_cast<unsigned short>(year));
-    if (long const month = _number(text, 5, 2)) setMonth(static_cast<unsigned char>(month));
-    if (long const day = _number(text, 8, 2)) setDay(static_cast<unsigned char>(day));
+    if (long const year = _number<4>(text, 0)) setYear(static_cast<unsigned short>(year));
+    if (long const month = _number<2>(text, 5)) setMonth(static_cast<unsigned char>(month));
+    if (long const day = _number<2>(text, 8)) setDay(static_cast<unsigned char>(day));
 }
 
 void DateTime::readTime(std::string const& text) {
@@ -129,9 +133,9 @@ void DateTime::readTime(std::string const& text) {
         start = 11;
         _check(_has(text, 13, ':') && _has(text, 16, ':'), "incorrect format.");
     }
-    setHour(static_cast<unsigned char>(_number(text, start, 2)));
-    setMinute(static_cast<unsigned char>(_number(text, start + 3, 2)));
-    setSecond(static_cast<unsigned char>(_number(text, start + 6, 2)));
+    setHour(static_cast<unsigned char>(_number<2>(text, start)));
+    setMinute(static_cast<unsigned char>(_number<2>(text, start + 3)));
+    setSecond(static_cast<unsigned char>(_number<2>(text, start + 6)));
 }
 
 std::uint16_t DateTime::getYear() const { return year_; }

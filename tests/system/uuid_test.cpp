@@ -1,0 +1,460 @@
+// Identifiers: 16 bytes and their text.
+#include <koru/uuid.h>
+
+#include <algorithm>
+#include <array>
+#include <cstddef>
+#include <cstring>
+#include <iomanip>
+#include <locale>
+#include <random>
+#include <sstream>
+#include <string>
+#include <type_traits>
+#include <vector>
+
+#include <doctest/doctest.h>
+
+namespace {
+
+using Bytes = std::vector<unsigned char>;
+
+Bytes bytesOf(Koru::Uuid const& uuid) { return uuid; }
+std::string textOf(Koru::Uuid const& uuid) { return uuid; }
+Bytes parsed(std::string const& text) { return bytesOf(Koru::Uuid(text)); }
+
+/// Bytes as a test's output and expectation show them: "01 23 ab".
+std::string shown(Bytes const& bytes) {
+    static char const digits[] = "0123456789abcdef";
+    std::string result;
+    for (unsigned char const b : bytes) {
+        if (!result.empty()) result += ' ';
+        result += digits[b >> 4];
+        result += digits[b & 15];
+    }
+    return result;
+}
+
+Bytes const ZERO(16, 0);
+std::string const ZERO_TEXT = "00000000-0000-0000-0000-000000000000";
+
+std::string const TEXT = "0123abcd-4567-89ab-cdef-0123456789ab";
+unsigned char const BYTES[16] = {0x01, 0x23, 0xab, 0xcd, 0x45, 0x67, 0x89, 0xab,
+                                 0xcd, 0xef, 0x01, 0x23, 0x45, 0x67, 0x89, 0xab};
+Bytes const VECTOR(BYTES, BYTES + 16);
+
+int digitValue(char c) {
+    if (c >= '0' && c <= '9') return c - '0';
+    if (c >= 'a' && c <= 'f') return c - 'a' + 10;
+    if (c >= 'A' && c <= 'F') return c - 'A' + 10;
+    return -1;
+}
+
+/// What a text is read as, in the plainest way: 36 characters up to the first NUL; a second copy of
+/// them with the hyphens taken out and, to make up for those, as many of the text's last characters
+/// put behind; all of that digits; 32 of it used.
+Bytes modelOf(std::string const& stored) {
+    std::string const text = stored.substr(0, stored.find('\0'));
+    if (text.size() != 36) return ZERO;
+    std::string buffer;
+    for (char const c : text) {
+        if (c != '-') buffer += c;
+    }
+    std::size_t const hyphens = 36 - buffer.size();
+    buffer += text.substr(36 - hyphens);
+    for (char const c : buffer) {
+        if (digitValue(c) < 0) return ZERO;
+    }
+    Bytes bytes;
+    for (std::size_t i = 0; i < 16; ++i) {
+        int const value = digitValue(buffer[2 * i]) * 16 + digitValue(buffer[2 * i + 1]);
+        bytes.push_back(static_cast<unsigned char>(value));
+    }
+    return bytes;
+}
+
+/// The text of 16 bytes, written digit by digit.
+std::string modelText(Bytes const& bytes) {
+    std::string text;
+    for (std::size_t i = 0; i < bytes.size(); ++i) {
+        if (i == 4 || i == 6 || i == 8 || i == 10) text += '-';
+        text += shown({bytes[i]});
+    }
+    return text;
+}
+
+/// Numbers with a separator after each digit, as no locale writes them but some could.
+class SeparatingNumbers : public std::numpunct<char> {
+protected:
+    char do_thousands_sep() const override { return '.'; }
+    std::string do_grouping() const override { return "\1"; }
+};
+
+/// Sets the locale that new streams get, for a scope.
+class GlobalLocale {
+public:
+    explicit GlobalLocale(std::locale const& locale) : before_(std::locale::global(locale)) {}
+    GlobalLocale(GlobalLocale const&) = delete;
+    GlobalLocale& operator=(GlobalLocale const&) = delete;
+    ~GlobalLocale() { std::locale::global(before_); }
+
+private:
+    std::locale before_;
+};
+
+} // namespace
+
+// ========================================================================================= shape
+
+TEST_CASE("an identifier is a plain value of 16 bytes") {
+    CHECK(sizeof(Koru::Uuid) == 16);
+    CHECK(alignof(Koru::Uuid) == 1);
+    CHECK(!std::is_polymorphic<Koru::Uuid>::value);
+    CHECK(std::is_trivially_copyable<Koru::Uuid>::value);
+    CHECK(std::is_standard_layout<Koru::Uuid>::value);
+    Koru::Uuid const uuid(BYTES);
+    CHECK(std::memcmp(&uuid, BYTES, sizeof uuid) == 0);
+}
+
+TEST_CASE("an identifier is made from nothing, 16 bytes, a vector or text") {
+    CHECK(std::is_default_constructible<Koru::Uuid>::value);
+    CHECK(std::is_constructible<Koru::Uuid, unsigned char const(&)[16]>::value);
+    CHECK(std::is_constructible<Koru::Uuid, unsigned char(&)[16]>::value);
+    CHECK(std::is_constructible<Koru::Uuid, Bytes>::value);
+    CHECK(std::is_constructible<Koru::Uuid, std::string>::value);
+    CHECK(!std::is_constructible<Koru::Uuid, unsigned char const(&)[15]>::value);
+    CHECK(!std::is_constructible<Koru::Uuid, unsigned char const(&)[17]>::value);
+    CHECK(!std::is_constructible<Koru::Uuid, std::wstring>::value);
+}
+
+TEST_CASE("a default identifier is all zero") {
+    Koru::Uuid const uuid;
+    CHECK(shown(bytesOf(uuid)) == shown(ZERO));
+    CHECK(textOf(uuid) == ZERO_TEXT);
+}
+
+TEST_CASE("a copy has the bytes of the original and a life of its own") {
+    Koru::Uuid original(BYTES);
+    Koru::Uuid const copy(original);
+    Koru::Uuid assigned;
+    assigned = original;
+    original = Koru::Uuid();
+    CHECK(shown(bytesOf(copy)) == shown(VECTOR));
+    CHECK(shown(bytesOf(assigned)) == shown(VECTOR));
+    CHECK(shown(bytesOf(original)) == shown(ZERO));
+    Koru::Uuid& self = assigned;
+    assigned = self;
+    CHECK(shown(bytesOf(assigned)) == shown(VECTOR));
+}
+
+// ========================================================================================= bytes
+
+TEST_CASE("16 bytes are kept in the order given") {
+    CHECK(shown(bytesOf(Koru::Uuid(BYTES))) == shown(VECTOR));
+    unsigned char all[16];
+    for (unsigned i = 0; i < 16; ++i) all[i] = static_cast<unsigned char>(0xF0 + i);
+    CHECK(shown(bytesOf(Koru::Uuid(all))) == "f0 f1 f2 f3 f4 f5 f6 f7 f8 f9 fa fb fc fd fe ff");
+}
+
+TEST_CASE("an identifier does not change with the array or the vector it was made from") {
+    unsigned char array[16];
+    std::copy(VECTOR.begin(), VECTOR.end(), array);
+    Bytes vector = VECTOR;
+    Koru::Uuid const fromArray(array);
+    Koru::Uuid const fromVector(vector);
+    std::fill(array, array + 16, static_cast<unsigned char>(0xEE));
+    std::fill(vector.begin(), vector.end(), static_cast<unsigned char>(0xEE));
+    CHECK(shown(bytesOf(fromArray)) == shown(VECTOR));
+    CHECK(shown(bytesOf(fromVector)) == shown(VECTOR));
+}
+
+TEST_CASE("a vector of any size but 16 gives the identifier of zeros") {
+    for (std::size_t size = 0; size <= 40; ++size) {
+        CAPTURE(size);
+        Bytes const bytes(size, 0xA5);
+        Bytes const expected = size == 16 ? bytes : ZERO;
+        CHECK(shown(bytesOf(Koru::Uuid(bytes))) == shown(expected));
+    }
+    CHECK(shown(bytesOf(Koru::Uuid(Bytes(1U << 16, 1)))) == shown(ZERO));
+}
+
+TEST_CASE("the vector of an identifier is new each time and always of 16 bytes") {
+    for (Koru::Uuid const& uuid : {Koru::Uuid(), Koru::Uuid(BYTES), Koru::Uuid(Bytes(17, 1))}) {
+        CHECK(bytesOf(uuid).size() == 16);
+    }
+    Koru::Uuid const uuid(BYTES);
+    Bytes first = uuid;
+    first[0] = 0xFF;
+    first.clear();
+    CHECK(shown(bytesOf(uuid)) == shown(VECTOR));
+}
+
+// ========================================================================================= text
+// out
+
+TEST_CASE("the text has groups of 8, 4, 4, 4 and 12 lower-case digits in the order of the bytes") {
+    CHECK(textOf(Koru::Uuid(BYTES)) == TEXT);
+    CHECK(textOf(Koru::Uuid(Bytes(16, 0xFF))) == "ffffffff-ffff-ffff-ffff-ffffffffffff");
+    CHECK(textOf(Koru::Uuid(Bytes(16, 0x0A))) == "0a0a0a0a-0a0a-0a0a-0a0a-0a0a0a0a0a0a");
+}
+
+TEST_CASE("every value of every byte is two digits of the text") {
+    for (std::size_t at = 0; at < 16; ++at) {
+        for (unsigned value = 0; value < 256; ++value) {
+            Bytes bytes = ZERO;
+            bytes[at] = static_cast<unsigned char>(value);
+            std::string const text = textOf(Koru::Uuid(bytes));
+            bool const same = text == modelText(bytes) && parsed(text) == bytes;
+            if (same) continue;
+            CAPTURE(at);
+            CAPTURE(value);
+            CHECK(text == modelText(bytes));
+            CHECK(shown(parsed(text)) == shown(bytes));
+        }
+    }
+}
+
+TEST_CASE("the text is the same when streams are given a locale that separates digits") {
+    GlobalLocale const global(std::locale(std::locale::classic(), new SeparatingNumbers));
+    std::ostringstream separated;
+    separated << 1234;
+    REQUIRE(separated.str() == "1.2.3.4");
+    CHECK(textOf(Koru::Uuid(BYTES)) == TEXT);
+    CHECK(shown(parsed(TEXT)) == shown(VECTOR));
+}
+
+// ========================================================================================= text in
+
+TEST_CASE("text is read with upper and lower case digits and hyphens anywhere but near the end") {
+    struct Row {
+        char const* label;
+        char const* text;
+    };
+    Row const rows[] = {
+        {"as it is written", "0123abcd-4567-89ab-cdef-0123456789ab"},
+        {"mixed case", "0123ABCD-4567-89ab-CDEF-0123456789AB"},
+        {"upper case", "0123ABCD-4567-89AB-CDEF-0123456789AB"},
+        {"hyphens elsewhere", "0123-ABCD4567-89ab-CDEF0123-456789AB"},
+        {"hyphens first", "----0123abcd456789abcdef0123456789ab"},
+        {"hyphens side by side", "0123abcd--456789abcdef--0123456789ab"},
+        {"hyphens as late as they may be", "0123abcd456789abcdef01234567----89ab"},
+        {"no hyphens, the last four digits ignored", "0123abcd456789abcdef0123456789abFFFF"},
+        {"one hyphen, the last three digits ignored", "0123abcd-456789abcdef0123456789ab012"},
+        {"two hyphens", "-0123abcd-456789abcdef0123456789ab99"},
+        {"three hyphens", "-0123abcd-4567-89abcdef0123456789ab7"},
+    };
+    for (Row const& row : rows) {
+        CAPTURE(row.label);
+        CHECK(shown(parsed(row.text)) == shown(VECTOR));
+        CHECK(textOf(Koru::Uuid(std::string(row.text))) == TEXT);
+    }
+}
+
+TEST_CASE("with more than four hyphens the last digits are read twice") {
+    struct Row {
+        int hyphens;
+        char const* digits;
+        char const* expected;
+    };
+    Row const rows[] = {
+        // 31 digits, and of the last five repeated the first is used
+        {5, "0123456789abcdef0123456789abcde", "01 23 45 67 89 ab cd ef 01 23 45 67 89 ab cd ea"},
+        // 30 digits, and of the last six repeated two are used
+        {6, "0123456789abcdef0123456789abcd", "01 23 45 67 89 ab cd ef 01 23 45 67 89 ab cd 89"},
+        // 19 digits, and 13 of the last 17
+        {17, "0123456789abcdef012", "01 23 45 67 89 ab cd ef 01 22 34 56 78 9a bc de"},
+        // half of it hyphens: 18 digits, and 14 of them once more
+        {18, "0123456789abcdef01", "01 23 45 67 89 ab cd ef 01 01 23 45 67 89 ab cd"},
+    };
+    for (Row const& row : rows) {
+        CAPTURE(row.hyphens);
+        std::string const text =
+            std::string(static_cast<std::size_t>(row.hyphens), '-') + row.digits;
+        REQUIRE(text.size() == 36);
+        CHECK(shown(parsed(text)) == row.expected);
+    }
+}
+
+TEST_CASE("text with a hyphen among the last characters is refused, counted as its hyphens are") {
+    for (std::size_t hyphens = 1; hyphens <= 36; ++hyphens) {
+        CAPTURE(hyphens);
+        // Of a run of k hyphens none is among the last k characters when it ends k before the end.
+        for (std::size_t after = 0; after + hyphens <= 36; ++after) {
+            CAPTURE(after);
+            std::string const text = std::string(36 - hyphens - after, 'a') +
+                                     std::string(hyphens, '-') + std::string(after, 'a');
+            Bytes const expected = after >= hyphens ? Bytes(16, 0xAA) : ZERO;
+            CHECK(shown(parsed(text)) == shown(expected));
+        }
+    }
+}
+
+TEST_CASE("text of any length but 36 is refused") {
+    for (std::size_t size = 0; size <= 80; ++size) {
+        CAPTURE(size);
+        Bytes const expected = size == 36 ? Bytes(16, 0x77) : ZERO;
+        CHECK(shown(parsed(std::string(size, '7'))) == shown(expected));
+    }
+    CHECK(shown(parsed("")) == shown(ZERO));
+    CHECK(shown(parsed("{" + TEXT + "}")) == shown(ZERO));
+    CHECK(shown(parsed("urn:uuid:" + TEXT)) == shown(ZERO));
+    CHECK(shown(parsed(TEXT + "\n")) == shown(ZERO));
+    CHECK(shown(parsed(" " + TEXT)) == shown(ZERO));
+    CHECK(shown(parsed("0123abcd456789abcdef0123456789ab")) == shown(ZERO)); // 32 digits
+    CHECK(shown(parsed(std::string(36 + 256, '7'))) == shown(ZERO));
+    CHECK(shown(parsed(std::string(36 + 65536, '7'))) == shown(ZERO));
+}
+
+TEST_CASE("text ends at its first NUL") {
+    std::string const nul(1, '\0');
+    CHECK(shown(parsed(TEXT + nul)) == shown(VECTOR));
+    CHECK(shown(parsed(TEXT + nul + "and more")) == shown(VECTOR));
+    CHECK(shown(parsed(nul + TEXT)) == shown(ZERO));
+    CHECK(shown(parsed(nul)) == shown(ZERO));
+    for (std::size_t at = 0; at < 36; ++at) {
+        CAPTURE(at);
+        std::string text(36, 'b');
+        text[at] = '\0';
+        CHECK(shown(parsed(text)) == shown(ZERO));
+        CHECK(shown(parsed(text + std::string(36, 'b'))) == shown(ZERO));
+    }
+}
+
+TEST_CASE("any character but digits and hyphens is refused, wherever it stands") {
+    std::string const noHyphens(36, 'c');
+    for (std::size_t at = 0; at < 36; ++at) {
+        for (int value = 1; value < 256; ++value) {
+            char const c = static_cast<char>(value);
+            if (c == '-' || digitValue(c) >= 0) continue;
+            bool refused = true;
+            for (std::string text : {TEXT, noHyphens}) {
+                text[at] = c;
+                refused = refused && parsed(text) == ZERO;
+            }
+            if (refused) continue;
+            CAPTURE(at);
+            CAPTURE(value);
+            CHECK(refused);
+        }
+    }
+}
+
+TEST_CASE("a refused text leaves nothing of itself behind") {
+    // The last character decides, after 35 good ones.
+    CHECK(shown(parsed("0123abcd-4567-89ab-cdef-0123456789aG")) == shown(ZERO));
+    CHECK(shown(parsed("0123abcd456789abcdef0123456789ab012x")) == shown(ZERO));
+    CHECK(shown(parsed("0x23abcd-4567-89ab-cdef-0123456789ab")) == shown(ZERO));
+    CHECK(shown(parsed("+123abcd-4567-89ab-cdef-0123456789ab")) == shown(ZERO));
+    CHECK(shown(parsed(" 123abcd-4567-89ab-cdef-0123456789ab")) == shown(ZERO));
+}
+
+TEST_CASE("text is read as a plain model reads it") {
+    std::mt19937 random(20260131);
+    auto const below = [&random](std::size_t n) { return static_cast<std::size_t>(random() % n); };
+    std::string const digits = "0123456789abcdefABCDEF";
+    std::string const others = std::string("\0", 1) + "gGxX +{}/:@`\x7f\x80\xff";
+    int accepted = 0;
+    for (int round = 0; round < 60000; ++round) {
+        std::size_t const size = below(5) == 0 ? below(41) : 36;
+        std::string text;
+        for (std::size_t i = 0; i < size; ++i) text += digits[below(digits.size())];
+        if (size > 0) {
+            // Most hyphens keep clear of the end, or hardly any text would be accepted.
+            std::size_t const reach = below(3) == 0 ? size : (size + 1) / 2;
+            std::size_t const hyphens = below(4) == 0 ? below(37) : below(7);
+            for (std::size_t i = 0; i < hyphens; ++i) text[below(reach)] = '-';
+            if (below(8) == 0) text[below(size)] = others[below(others.size())];
+        }
+        if (below(16) == 0) text += std::string("\0tail", below(6));
+        Bytes const expected = modelOf(text);
+        Bytes const actual = parsed(text);
+        if (expected != ZERO) ++accepted;
+        if (actual == expected) continue;
+        CAPTURE(round);
+        CAPTURE(text);
+        CHECK(shown(actual) == shown(expected));
+    }
+    CHECK(accepted > 10000);
+    CHECK(accepted < 50000);
+}
+
+TEST_CASE("16 bytes survive the way through the text and back") {
+    std::mt19937 random(19680503);
+    for (int round = 0; round < 5000; ++round) {
+        Bytes bytes;
+        for (int i = 0; i < 16; ++i) bytes.push_back(static_cast<unsigned char>(random() & 0xFF));
+        std::string const text = textOf(Koru::Uuid(bytes));
+        if (text == modelText(bytes) && parsed(text) == bytes) continue;
+        CHECK(text == modelText(bytes));
+        CHECK(shown(parsed(text)) == shown(bytes));
+    }
+}
+
+// =========================================================================================
+// equality
+
+TEST_CASE("identifiers are equal exactly when all their bits are") {
+    Koru::Uuid const uuid(BYTES);
+    CHECK(uuid == uuid);
+    CHECK(uuid == Koru::Uuid(BYTES));
+    CHECK(!(uuid != Koru::Uuid(BYTES)));
+    CHECK(uuid == Koru::Uuid(TEXT));
+    CHECK(Koru::Uuid() == Koru::Uuid(ZERO_TEXT));
+    for (unsigned bit = 0; bit < 128; ++bit) {
+        CAPTURE(bit);
+        Bytes bytes = VECTOR;
+        bytes[bit / 8] = static_cast<unsigned char>(bytes[bit / 8] ^ (1U << bit % 8));
+        Koru::Uuid const other(bytes);
+        CHECK(!(uuid == other));
+        CHECK(!(other == uuid));
+        CHECK(uuid != other);
+        CHECK(other != uuid);
+    }
+}
+
+TEST_CASE("a refused text cannot be told from the text of the default identifier") {
+    CHECK(Koru::Uuid(std::string("nonsense")) == Koru::Uuid(ZERO_TEXT));
+}
+
+// ========================================================================================= streams
+
+TEST_CASE("the inserter writes the text and returns the stream") {
+    std::ostringstream out;
+    std::ostream& returned = out << Koru::Uuid(BYTES);
+    CHECK(&returned == &out);
+    out << '|' << Koru::Uuid();
+    CHECK(out.str() == TEXT + "|" + ZERO_TEXT);
+}
+
+TEST_CASE("width and fill go to the first character, before or behind it") {
+    std::ostringstream out;
+    out << std::setw(5) << std::setfill('*') << Koru::Uuid(BYTES);
+    CHECK(out.str() == "****" + TEXT);
+    CHECK(out.width() == 0);
+
+    std::ostringstream left;
+    left << std::left << std::setw(5) << std::setfill('*') << Koru::Uuid(BYTES);
+    CHECK(left.str() == "0****" + TEXT.substr(1));
+
+    std::ostringstream wide;
+    wide << std::setw(40) << Koru::Uuid(BYTES);
+    CHECK(wide.str() == std::string(39, ' ') + TEXT);
+}
+
+TEST_CASE("the inserter takes no notice of the stream's number format and leaves it alone") {
+    std::ostringstream out;
+    out << std::oct << std::uppercase << std::showbase << std::setfill('#');
+    std::ios_base::fmtflags const flags = out.flags();
+    out << Koru::Uuid(BYTES);
+    CHECK(out.str() == TEXT);
+    CHECK(out.flags() == flags);
+    CHECK(out.fill() == '#');
+}
+
+TEST_CASE("nothing is written to a stream that has failed") {
+    std::ostringstream out;
+    out.setstate(std::ios_base::failbit);
+    out << Koru::Uuid(BYTES);
+    CHECK(out.str().empty());
+    CHECK(out.fail());
+}
