@@ -4,8 +4,9 @@
 #ifndef KORU_BENCH_HARNESS_H
 #define KORU_BENCH_HARNESS_H
 
+#include <time.h>
+
 #include <algorithm>
-#include <chrono>
 #include <cstddef>
 #include <cstdio>
 #include <cstdlib>
@@ -31,20 +32,39 @@ inline void require(bool condition, char const* what) {
     std::exit(1);
 }
 
+/// Seconds since its construction. A stretch that is long enough to be interrupted is measured in
+/// the thread's processor time, kernel included, so that other programs do not count; a short one
+/// by the cheaper clock, read within the other.
+class Stopwatch {
+public:
+    double seconds() const {
+        double const passed = read(CLOCK_MONOTONIC) - start_;
+        return passed < 0.0001 ? passed : read(CLOCK_THREAD_CPUTIME_ID) - processorStart_;
+    }
+
+private:
+    static double read(clockid_t clock) {
+        timespec time;
+        ::clock_gettime(clock, &time);
+        return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9;
+    }
+
+    double processorStart_ = read(CLOCK_THREAD_CPUTIME_ID);
+    double start_ = read(CLOCK_MONOTONIC);
+};
+
 /// Something that can be done over and over, and timed.
 class Work {
 public:
-    using Clock = std::chrono::steady_clock;
-
     Work() = default;
 
     /// Work that can follow on itself: the clock is read around the whole loop.
     template <class Body>
     static Work repeated(Body body) {
         return Work([body](std::size_t count) mutable {
-            auto const start = Clock::now();
+            Stopwatch const watch;
             for (std::size_t i = 0; i < count; ++i) keep(body());
-            return since(start);
+            return watch.seconds();
         });
     }
 
@@ -55,9 +75,9 @@ public:
             double total = 0;
             for (std::size_t i = 0; i < count; ++i) {
                 prepare();
-                auto const start = Clock::now();
+                Stopwatch const watch;
                 keep(body());
-                total += since(start);
+                total += watch.seconds();
             }
             return total;
         });
@@ -81,10 +101,6 @@ public:
 
 private:
     explicit Work(std::function<double(std::size_t)> time) : time_(std::move(time)) {}
-
-    static double since(Clock::time_point start) {
-        return std::chrono::duration<double>(Clock::now() - start).count();
-    }
 
     std::function<double(std::size_t)> time_;
 };
@@ -114,10 +130,11 @@ public:
         for (int i = 1; i < argc; ++i) take(argv[i]);
     }
 
-    /// Fewer and shorter rounds: to see that all of it runs, not for numbers.
+    /// Fewer rounds: to see that all of it runs, not for numbers.
     bool quick() const { return quick_; }
     /// Shows every rival; otherwise only the fastest peer, the limits and who is missing.
     bool all() const { return all_; }
+    /// At least; quick work gets up to five times as many.
     std::size_t rounds() const { return rounds_; }
     bool wants(std::string const& row) const { return row.find(filter_) != std::string::npos; }
 
@@ -202,12 +219,13 @@ public:
     }
 
 private:
-    /// The index of the peer with the least time; the number of rivals when none takes part.
+    /// The index of the peer that comes off best against ours, by the ratios, since only they hold
+    /// on a busy machine; the number of rivals when none takes part.
     static std::size_t fastestPeer(std::vector<Row> const& rows, std::vector<Rival> const& rivals) {
         std::size_t fastest = rows.size();
         for (std::size_t i = 0; i < rows.size(); ++i) {
             if (rivals[i].limit || !rivals[i].work) continue;
-            if (fastest == rows.size() || rows[i].theirs < rows[fastest].theirs) fastest = i;
+            if (fastest == rows.size() || rows[i].ratio > rows[fastest].ratio) fastest = i;
         }
         return fastest;
     }
@@ -223,7 +241,8 @@ private:
         std::vector<double> ourTimes;
         std::vector<double> theirTimes;
         std::vector<double> ratios;
-        for (std::size_t round = 0; round < options_.rounds(); ++round) {
+        Stopwatch const watch;
+        while (goesOn(ratios.size(), watch.seconds())) {
             ourTimes.push_back(ours.time(ourCount) / static_cast<double>(ourCount) / units);
             theirTimes.push_back(rival.work.time(theirCount) / static_cast<double>(theirCount) /
                                  units);
@@ -236,15 +255,21 @@ private:
         return row;
     }
 
+    /// Many short turns: the shorter a turn is, the fewer of them something else falls into, and
+    /// the median forgets those.
+    bool goesOn(std::size_t rounds, double seconds) const {
+        if (rounds < options_.rounds()) return true;
+        return !options_.quick() && rounds < 5 * options_.rounds() && seconds < 0.1;
+    }
+
     /// How many runs make a series long enough for the clock; also warms up. Preparation, which is
     /// not timed, counts here, or a cheap body behind a dear preparation would take forever.
-    std::size_t calibrate(Work const& work) const {
-        double const enough = options_.quick() ? 0.0003 : 0.003;
+    static std::size_t calibrate(Work const& work) {
+        double const enough = 0.0005;
         for (std::size_t count = 1;; count *= 2) {
-            auto const start = Work::Clock::now();
+            Stopwatch const watch;
             double const timed = work.time(count);
-            double const passed = std::chrono::duration<double>(Work::Clock::now() - start).count();
-            if (timed >= enough || passed >= 5 * enough) return count;
+            if (timed >= enough || watch.seconds() >= 5 * enough) return count;
         }
     }
 

@@ -1,12 +1,14 @@
 // Settings files with sections: load, look up, change, save and the whole cycle, from 50 to 200,000
 // entries.
 //
-// What is compared: our names are wide, match without regard to case and come back as copies in
-// wide strings. SimpleIni works on narrow UTF-8 (CSimpleIniCaseA with SetUnicode) and
-// Boost.PropertyTree and GLib on bytes; all three match case exactly and none converts, which is
-// less work than ours. Our save deletes the file and writes it anew, as the contract has it, where
-// the others empty it (GLib writes a temporary file and renames it).
+// What is compared: our names and values are wide at the interface, and names match without regard
+// to case. SimpleIni (CSimpleIniCaseA with SetUnicode, its variant for narrow UTF-8), GKeyFile and
+// Boost.PropertyTree are narrow and match case exactly, which is less work. To do the same job they
+// are given wide names and asked for wide values, by the library's own conversions; look-ups with
+// narrow names and values stand beside that. Our save deletes the file and writes it anew, as its
+// header says, where the others empty it (GKeyFile writes a temporary file and renames it).
 #include <koru/initializationfile.h>
+#include <koru/string.h>
 
 #include <fcntl.h>
 #include <stdlib.h>
@@ -70,37 +72,34 @@ private:
     std::string path_;
 };
 
-std::wstring _widen(std::string const& ascii) { return std::wstring(ascii.begin(), ascii.end()); }
-
-/// A name or value in the form that each library takes.
-struct Text {
-    std::string narrow;
-    std::wstring wide;
-
-    explicit Text(std::string const& ascii) : narrow(ascii), wide(_widen(ascii)) {}
-};
-
+/// Names in both forms, and a value.
 struct Entry {
-    Text section;
-    Text key;
-    Text value;
+    std::string section;
+    std::string key;
+    std::string value;
+    std::wstring wideSection;
+    std::wstring wideKey;
 };
 
-/// Entries in sections of twenty, in the order of their names.
+Entry _entry(std::string const& section, std::string const& key, std::string const& value) {
+    return {section, key, value, Koru::make_wstring(section), Koru::make_wstring(key)};
+}
+
+/// Entries in sections of twenty, in the order of their names, some fifty bytes a line.
 std::vector<Entry> _entries(std::size_t count) {
     static char const* const words[] = {"address", "backup", "cache",  "delay", "enabled",
                                         "filter",  "group",  "height", "index", "limit"};
     std::vector<Entry> entries;
     entries.reserve(count);
-    char text[64];
+    char section[64];
+    char value[64];
     for (std::size_t i = 0; i < count; ++i) {
-        std::snprintf(text, sizeof text, "section%06u", static_cast<unsigned>(i / 20));
-        Text const section(text);
-        std::snprintf(text, sizeof text, "%s.%u", words[i % 20 / 2],
-                      static_cast<unsigned>(i % 2 + 1));
-        Text const key(text);
-        std::snprintf(text, sizeof text, "value %u", static_cast<unsigned>(i * 7919 % 1000003));
-        entries.push_back({section, key, Text(text)});
+        std::snprintf(section, sizeof section, "Section %06u", static_cast<unsigned>(i / 20));
+        std::string const key =
+            std::string(words[i % 20 / 2]) + (i % 2 == 0 ? ".default.value" : ".maximum.value");
+        std::snprintf(value, sizeof value, "/usr/share/application/%06u",
+                      static_cast<unsigned>(i * 7919 % 1000003));
+        entries.push_back(_entry(section, key, value));
     }
     return entries;
 }
@@ -126,18 +125,18 @@ void _write(std::string const& path, std::vector<Entry> const& entries) {
     std::ofstream out(path);
     std::string const* section = nullptr;
     for (Entry const& entry : entries) {
-        if (section == nullptr || *section != entry.section.narrow) {
-            out << '[' << entry.section.narrow << "]\n";
+        if (section == nullptr || *section != entry.section) {
+            out << '[' << entry.section << "]\n";
         }
-        section = &entry.section.narrow;
-        out << entry.key.narrow << '=' << entry.value.narrow << '\n';
+        section = &entry.section;
+        out << entry.key << '=' << entry.value << '\n';
     }
     out.close();
     bench::require(!out.fail(), "cannot write a settings file");
 }
 
-// The contenders. Each is made for a path and has load(), size of get(entry), set(entry, value) and
-// save(); an object is used once.
+// The contenders. Each is made for a path and used once. get gives the size of a value; find, of
+// those with narrow names, hands the value to a function.
 
 class Ours {
 public:
@@ -147,10 +146,10 @@ public:
 
     void load() { file_.open(Koru::File::READ | Koru::File::WRITE); }
     std::size_t get(Entry const& entry) {
-        return file_.getValue(entry.section.wide, entry.key.wide).size();
+        return file_.getValue(entry.wideSection, entry.wideKey).size();
     }
-    void set(Entry const& entry, Text const& value) {
-        file_.setValue(entry.section.wide, entry.key.wide, value.wide);
+    void set(Entry const& entry, std::wstring const& value) {
+        file_.setValue(entry.wideSection, entry.wideKey, value);
     }
     void save() { file_.close(); }
     /// Before the object is destroyed without being saved: the destructor would write.
@@ -171,18 +170,18 @@ public:
     }
 
     void load() { bench::require(file_.LoadFile(path_.c_str()) == SI_OK, "SimpleIni: load"); }
-    std::size_t get(Entry const& entry) {
-        return std::strlen(
-            file_.GetValue(entry.section.narrow.c_str(), entry.key.narrow.c_str(), ""));
+    template <class Use>
+    std::size_t find(std::string const& section, std::string const& key, Use use) {
+        char const* const value = file_.GetValue(section.c_str(), key.c_str());
+        bench::require(value != nullptr, "SimpleIni: get");
+        return use(value);
     }
-    void set(Entry const& entry, Text const& value) {
-        file_.SetValue(entry.section.narrow.c_str(), entry.key.narrow.c_str(),
-                       value.narrow.c_str());
+    void set(std::string const& section, std::string const& key, std::string const& value) {
+        file_.SetValue(section.c_str(), key.c_str(), value.c_str());
     }
     void save() {
         bench::require(file_.SaveFile(path_.c_str(), false) == SI_OK, "SimpleIni: save");
     }
-    void abandon() {}
 
 private:
     std::string path_;
@@ -198,17 +197,21 @@ public:
     explicit PropertyTree(std::string const& path) : path_(path) {}
 
     void load() { boost::property_tree::read_ini(path_, tree_); }
-    // By find, since the keys contain the dot that paths through a tree are split at.
-    std::size_t get(Entry const& entry) { return node(entry).data().size(); }
-    void set(Entry const& entry, Text const& value) { node(entry).data() = value.narrow; }
+    template <class Use>
+    std::size_t find(std::string const& section, std::string const& key, Use use) {
+        return use(node(section, key).data());
+    }
+    void set(std::string const& section, std::string const& key, std::string const& value) {
+        node(section, key).data() = value;
+    }
     void save() { boost::property_tree::write_ini(path_, tree_); }
-    void abandon() {}
 
 private:
-    boost::property_tree::ptree& node(Entry const& entry) {
-        auto const section = tree_.find(entry.section.narrow);
+    // By find, since the keys contain the dot that paths through a tree are split at.
+    boost::property_tree::ptree& node(std::string const& sectionName, std::string const& keyName) {
+        auto const section = tree_.find(sectionName);
         bench::require(section != tree_.not_found(), "Boost.PropertyTree: section");
-        auto const key = section->second.find(entry.key.narrow);
+        auto const key = section->second.find(keyName);
         bench::require(key != section->second.not_found(), "Boost.PropertyTree: key");
         return key->second;
     }
@@ -233,29 +236,62 @@ public:
                            0,
                        "GKeyFile: load");
     }
-    std::size_t get(Entry const& entry) {
-        char* const value = g_key_file_get_value(file_, entry.section.narrow.c_str(),
-                                                 entry.key.narrow.c_str(), nullptr);
+    template <class Use>
+    std::size_t find(std::string const& section, std::string const& key, Use use) {
+        char* const value = g_key_file_get_value(file_, section.c_str(), key.c_str(), nullptr);
         bench::require(value != nullptr, "GKeyFile: get");
-        std::size_t const size = std::strlen(value);
+        std::size_t const result = use(static_cast<char const*>(value));
         g_free(value);
-        return size;
+        return result;
     }
-    void set(Entry const& entry, Text const& value) {
-        g_key_file_set_value(file_, entry.section.narrow.c_str(), entry.key.narrow.c_str(),
-                             value.narrow.c_str());
+    void set(std::string const& section, std::string const& key, std::string const& value) {
+        g_key_file_set_value(file_, section.c_str(), key.c_str(), value.c_str());
     }
     void save() {
         bench::require(g_key_file_save_to_file(file_, path_.c_str(), nullptr) != 0,
                        "GKeyFile: save");
     }
-    void abandon() {}
 
 private:
     std::string path_;
     GKeyFile* file_;
 };
 #endif
+
+std::size_t _size(char const* text) { return std::strlen(text); }
+std::size_t _size(std::string const& text) { return text.size(); }
+
+/// A narrow library on its own terms.
+template <class Settings>
+class Narrow : public Settings {
+public:
+    using Settings::Settings;
+
+    std::size_t get(Entry const& entry) {
+        return this->find(entry.section, entry.key, [](auto const& value) { return _size(value); });
+    }
+    void set(Entry const& entry, std::wstring const& value) {
+        Settings::set(entry.section, entry.key, Koru::make_string(value));
+    }
+    void abandon() {}
+};
+
+/// A narrow library that does our job.
+template <class Settings>
+class Wide : public Settings {
+public:
+    using Settings::Settings;
+
+    std::size_t get(Entry const& entry) {
+        return this->find(Koru::make_string(entry.wideSection), Koru::make_string(entry.wideKey),
+                          [](auto const& value) { return Koru::make_wstring(value).size(); });
+    }
+    void set(Entry const& entry, std::wstring const& value) {
+        Settings::set(Koru::make_string(entry.wideSection), Koru::make_string(entry.wideKey),
+                      Koru::make_string(value));
+    }
+    void abandon() {}
+};
 
 /// A file and what is done with it: 1,000 look-ups and 100 changes, spread over all entries.
 class Task {
@@ -274,6 +310,11 @@ public:
     std::size_t bytes() const { return bytes_; }
 
     template <class Settings>
+    std::size_t lookUpOne(Settings& settings) const {
+        return settings.get(lookedUp_.front());
+    }
+
+    template <class Settings>
     std::size_t lookUp(Settings& settings) const {
         std::size_t total = 0;
         for (Entry const& entry : lookedUp_) total += settings.get(entry);
@@ -284,7 +325,8 @@ public:
     /// text than the last time.
     template <class Settings>
     void change(Settings& settings) const {
-        static Text const values[] = {Text("changed value"), Text("another value")};
+        static std::wstring const values[] = {L"/var/cache/application/changed",
+                                              L"/var/cache/application/another"};
         turn_ = 1 - turn_;
         for (Entry const& entry : changed_) settings.set(entry, values[turn_]);
     }
@@ -322,6 +364,11 @@ public:
         settings_->load();
         return *settings_;
     }
+    /// Loads, and does whatever was put off until the first look-up.
+    Settings& loadReady() {
+        task_->lookUpOne(load());
+        return *settings_;
+    }
     Settings& settings() { return *settings_; }
     Task const& task() const { return *task_; }
     std::string const& path() const { return path_; }
@@ -332,7 +379,7 @@ private:
     std::unique_ptr<Settings> settings_;
 };
 
-enum class Step { load, lookUp, change, save, cycle };
+enum class Step { load, firstLookUp, lookUp, change, save, cycle };
 
 /// From nothing to a filled table.
 template <class Settings>
@@ -340,10 +387,21 @@ Work _load(std::shared_ptr<Slot<Settings>> slot) {
     return Work::prepared([slot] { slot->clear(); }, [slot] { return &slot->load(); });
 }
 
+/// One look-up, and whatever loading put off until then.
+template <class Settings>
+Work _firstLookUp(std::shared_ptr<Slot<Settings>> slot) {
+    return Work::prepared(
+        [slot] {
+            slot->clear();
+            slot->load();
+        },
+        [slot] { return slot->task().lookUpOne(slot->settings()); });
+}
+
 template <class Settings>
 Work _lookUp(std::shared_ptr<Slot<Settings>> slot) {
     return Work::repeated([slot] { return slot->task().lookUp(slot->settings()); })
-        .within([slot] { slot->load(); }, [slot] { slot->clear(); });
+        .within([slot] { slot->loadReady(); }, [slot] { slot->clear(); });
 }
 
 template <class Settings>
@@ -351,7 +409,7 @@ Work _change(std::shared_ptr<Slot<Settings>> slot) {
     return Work::prepared(
         [slot] {
             slot->clear();
-            slot->load();
+            slot->loadReady();
         },
         [slot] {
             slot->task().change(slot->settings());
@@ -392,6 +450,8 @@ Work _work(Task const& task, Step step) {
     switch (step) {
     case Step::load:
         return _load(slot);
+    case Step::firstLookUp:
+        return _firstLookUp(slot);
     case Step::lookUp:
         return _lookUp(slot);
     case Step::change:
@@ -404,54 +464,55 @@ Work _work(Task const& task, Step step) {
     return _cycle(slot);
 }
 
-/// A contender that finds what we find.
+/// Ends the program unless a contender finds what we find.
 template <class Settings>
-Rival _rival(Task const& task, Step step) {
+void _check(Task const& task) {
     Slot<Ours> ours(task);
     Slot<Settings> theirs(task);
     bench::require(task.lookUp(ours.load()) == task.lookUp(theirs.load()), Settings::name);
-    return bench::peer(Settings::name, _work<Settings>(task, step));
+}
+
+/// Adds a library to the rivals, at look-ups also on its own terms.
+template <class Settings>
+void _add(std::vector<Rival>& rivals, Task const& task, Step step) {
+    _check<Wide<Settings>>(task);
+    rivals.push_back(bench::peer(Settings::name, _work<Wide<Settings>>(task, step)));
+    if (step != Step::lookUp) return;
+    rivals.push_back(bench::limit(std::string(Settings::name) + ", narrow",
+                                  _work<Narrow<Settings>>(task, step)));
 }
 
 std::vector<Rival> _rivals([[maybe_unused]] Task const& task, [[maybe_unused]] Step step) {
-    return {
+    std::vector<Rival> rivals;
 #ifdef KORU_BENCH_HAS_SIMPLEINI
-        _rival<SimpleIni>(task, step),
+    _add<SimpleIni>(rivals, task, step);
 #else
-        bench::missing("SimpleIni"),
+    rivals.push_back(bench::missing("SimpleIni"));
 #endif
 #ifdef KORU_BENCH_HAS_PROPERTY_TREE
-        _rival<PropertyTree>(task, step),
+    _add<PropertyTree>(rivals, task, step);
 #else
-        bench::missing("Boost.PropertyTree"),
+    rivals.push_back(bench::missing("Boost.PropertyTree"));
 #endif
 #ifdef KORU_BENCH_HAS_GLIB
-        _rival<KeyFile>(task, step),
+    _add<KeyFile>(rivals, task, step);
 #else
-        bench::missing("GLib GKeyFile"),
+    rivals.push_back(bench::missing("GLib GKeyFile"));
 #endif
-    };
+    return rivals;
 }
 
-/// The bytes of a file, in memory that is not cleared first.
-struct Bytes {
-    std::unique_ptr<char[]> data;
-    std::size_t size;
-};
-
-Bytes _readWhole(Task const& task) {
-    Bytes bytes{std::unique_ptr<char[]>(new char[task.bytes()]), task.bytes()};
+void _readWhole(Task const& task, std::vector<char>& bytes) {
     int const file = ::open(task.path().c_str(), O_RDONLY | O_CLOEXEC);
-    ssize_t const n = ::read(file, bytes.data.get(), bytes.size);
+    ssize_t const n = ::read(file, bytes.data(), bytes.size());
     ::close(file);
-    bench::require(n == static_cast<ssize_t>(bytes.size), "cannot read a settings file");
-    return bytes;
+    bench::require(n == static_cast<ssize_t>(bytes.size()), "cannot read a settings file");
 }
 
-std::size_t _countLines(Bytes const& bytes) {
+std::size_t _countLines(std::vector<char> const& bytes) {
     std::size_t lines = 0;
-    char const* at = bytes.data.get();
-    char const* const end = at + bytes.size;
+    char const* at = bytes.data();
+    char const* const end = at + bytes.size();
     for (; at != end; ++lines) {
         void const* const found = std::memchr(at, '\n', static_cast<std::size_t>(end - at));
         if (found == nullptr) break;
@@ -460,22 +521,27 @@ std::size_t _countLines(Bytes const& bytes) {
     return lines;
 }
 
-/// Reading the file into memory and finding its lines.
+/// Reading the file, into memory that is there already, and finding its lines.
 Rival _readLimit(Task const& task, double goal) {
-    return bench::limit("read + memchr",
-                        Work::repeated([&task] { return _countLines(_readWhole(task)); }), goal);
+    std::vector<char> bytes(task.bytes());
+    return bench::limit("read + memchr", Work::repeated([&task, bytes]() mutable {
+                            _readWhole(task, bytes);
+                            return _countLines(bytes);
+                        }),
+                        goal);
 }
 
 /// Replacing the file by bytes that are ready.
 Rival _writeLimit(Task const& task, double goal) {
-    auto const bytes = std::make_shared<Bytes>(_readWhole(task));
+    std::vector<char> bytes(task.bytes());
+    _readWhole(task, bytes);
     return bench::limit("unlink + one write", Work::repeated([&task, bytes] {
                             ::unlink(task.path().c_str());
                             int const file = ::open(task.path().c_str(),
                                                     O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
-                            ssize_t const n = ::write(file, bytes->data.get(), bytes->size);
+                            ssize_t const n = ::write(file, bytes.data(), bytes.size());
                             ::close(file);
-                            bench::require(n == static_cast<ssize_t>(bytes->size), "write");
+                            bench::require(n == static_cast<ssize_t>(bytes.size()), "write");
                             return n;
                         }),
                         goal);
@@ -494,11 +560,10 @@ struct Size {
 
 void _sizes(bench::Report& report, MemoryDirectory const& directory, Size const& size) {
     std::string const prefix = std::string(size.name) + ", ";
-    std::vector<std::pair<Step, std::string>> const steps = {{Step::load, prefix + "load"},
-                                                             {Step::lookUp, prefix + "look up"},
-                                                             {Step::change, prefix + "change"},
-                                                             {Step::save, prefix + "save"},
-                                                             {Step::cycle, prefix + "whole cycle"}};
+    std::vector<std::pair<Step, std::string>> const steps = {
+        {Step::load, prefix + "load"},      {Step::firstLookUp, prefix + "first look-up"},
+        {Step::lookUp, prefix + "look up"}, {Step::change, prefix + "change"},
+        {Step::save, prefix + "save"},      {Step::cycle, prefix + "whole cycle"}};
     if (std::none_of(steps.begin(), steps.end(),
                      [&report](auto const& step) { return report.wants(step.second); })) {
         return;

@@ -1,0 +1,55 @@
+// DynamicLibrary: looking up a symbol, and loading a library that the process has already.
+#include <koru/dynamiclibrary.h>
+
+#include <dlfcn.h>
+
+#include <string>
+
+#include "harness.h"
+
+namespace {
+
+using bench::Work;
+
+constexpr char FILE_NAME[] = "libm.so.6";
+constexpr wchar_t WIDE_FILE_NAME[] = L"libm.so.6";
+
+void _symbol(bench::Report& report) {
+    Koru::DynamicLibrary library(WIDE_FILE_NAME);
+    bench::require(library.load(), "cannot load the library");
+    void* const handle = library.getHandle();
+    std::wstring const wide = L"nextafter";
+    std::string const narrow = "nextafter";
+    bench::require(library.getSymbol(wide) != nullptr &&
+                       library.getSymbol(wide) == ::dlsym(handle, narrow.c_str()),
+                   "the symbol was found somewhere else");
+    report.compare(
+        "symbol", Work::repeated([&] { return library.getSymbol(wide); }),
+        {bench::peer("dlsym", Work::repeated([&] { return ::dlsym(handle, narrow.c_str()); }))},
+        1.15);
+}
+
+void _load(bench::Report& report) {
+    Koru::DynamicLibrary library(WIDE_FILE_NAME);
+    report.compare("load + unload", Work::repeated([&] {
+                       bool const loaded = library.load();
+                       library.unload();
+                       return loaded;
+                   }),
+                   {bench::peer("dlopen + dlclose", Work::repeated([] {
+                                    void* const handle = ::dlopen(FILE_NAME, RTLD_LAZY);
+                                    ::dlclose(handle);
+                                    return handle;
+                                }))},
+                   1.15);
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+    // The library stays in the process: the first load reads a file, and is not what is compared.
+    bench::require(::dlopen(FILE_NAME, RTLD_LAZY) != nullptr, "there is no mathematics library");
+    bench::Report report("Koru dynamic library", bench::Options(argc, argv));
+    _symbol(report);
+    _load(report);
+}

@@ -1,0 +1,111 @@
+// Mutex: lock and unlock without a contender, free and nested.
+#include <koru/mutex.h>
+
+#include <pthread.h>
+
+#include <condition_variable>
+#include <mutex>
+#include <thread>
+
+#include "harness.h"
+
+namespace {
+
+using bench::Work;
+
+/// A second thread that sleeps: while a process has but one, the C library may take its
+/// mutexes without atomic operations, and no program with one thread needs a mutex.
+class Bystander {
+public:
+    Bystander() : thread_([this] { sleep(); }) {}
+
+    ~Bystander() {
+        {
+            std::lock_guard<std::mutex> const guard(mutex_);
+            done_ = true;
+        }
+        wake_.notify_one();
+        thread_.join();
+    }
+
+    Bystander(Bystander const&) = delete;
+    Bystander& operator=(Bystander const&) = delete;
+
+private:
+    void sleep() {
+        std::unique_lock<std::mutex> guard(mutex_);
+        wake_.wait(guard, [this] { return done_; });
+    }
+
+    std::mutex mutex_;
+    std::condition_variable wake_;
+    bool done_ = false;
+    std::thread thread_;
+};
+
+/// A recursive mutex of the C library.
+class PosixMutex {
+public:
+    PosixMutex() {
+        pthread_mutexattr_t attributes;
+        ::pthread_mutexattr_init(&attributes);
+        ::pthread_mutexattr_settype(&attributes, PTHREAD_MUTEX_RECURSIVE);
+        ::pthread_mutex_init(&mutex_, &attributes);
+        ::pthread_mutexattr_destroy(&attributes);
+    }
+
+    ~PosixMutex() { ::pthread_mutex_destroy(&mutex_); }
+
+    PosixMutex(PosixMutex const&) = delete;
+    PosixMutex& operator=(PosixMutex const&) = delete;
+
+    void lock() { ::pthread_mutex_lock(&mutex_); }
+    bool tryLock() { return ::pthread_mutex_trylock(&mutex_) == 0; }
+    void unlock() { ::pthread_mutex_unlock(&mutex_); }
+
+private:
+    pthread_mutex_t mutex_;
+};
+
+template <class Mutex>
+Work _cycle(Mutex& mutex) {
+    return Work::repeated([&mutex] {
+        mutex.lock();
+        mutex.unlock();
+        return 0;
+    });
+}
+
+void _uncontended(bench::Report& report, char const* row, bool nested, double goal) {
+    Koru::Mutex ours;
+    std::recursive_mutex standard;
+    PosixMutex posix;
+    if (nested) {
+        ours.lock();
+        standard.lock();
+        posix.lock();
+    }
+    report.compare(row, _cycle(ours),
+                   {bench::peer("std::recursive_mutex", _cycle(standard)),
+                    bench::peer("pthread, recursive", _cycle(posix)),
+                    bench::limit("pthread trylock + unlock", Work::repeated([&posix] {
+                                     bool const locked = posix.tryLock();
+                                     posix.unlock();
+                                     return locked;
+                                 }))},
+                   goal);
+    if (nested) {
+        ours.unlock();
+        standard.unlock();
+        posix.unlock();
+    }
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+    Bystander const bystander;
+    bench::Report report("Koru mutex", bench::Options(argc, argv));
+    _uncontended(report, "lock + unlock, free", false, 1.15);
+    _uncontended(report, "lock + unlock, nested", true, 1.5);
+}
