@@ -394,11 +394,11 @@ Work _ourLookUp(Task const& task) {
 }
 
 /// Inserts on top of the file, or into an empty one.
-Work _ourInsert(Task const& task, Records const& added, bool onTop) {
+Work _ourInsert(Task const& task, Records const& added, bool isTop) {
     Slot const slot = _slot();
     return Work::prepared(
-        [slot, onTop, empty = task.path("empty"), path = task.path()] {
-            if (onTop)
+        [slot, isTop, empty = task.path("empty"), path = task.path()] {
+            if (isTop)
                 _fresh(slot, path).load();
             else
                 _fresh(slot, empty).create();
@@ -435,10 +435,10 @@ Work _write(Task const& task) {
 }
 
 template <class Store>
-[[maybe_unused]] Work _insert(Task const& task, Records const& added, bool onTop) {
+[[maybe_unused]] Work _insert(Task const& task, Records const& added, bool isTop) {
     std::string const path = task.path(Store::name);
     ::unlink(path.c_str());
-    if (onTop) Store(path).write(task.records());
+    if (isTop) Store(path).write(task.records());
     auto const store = std::make_shared<std::unique_ptr<Store>>();
     return Work::prepared(
         [store, path] {
@@ -454,10 +454,10 @@ template <class Store>
 
 using Table = std::unordered_map<std::wstring, std::vector<unsigned char>>;
 
-Work _hashMapInsert(Task const& task, Records const& added, bool onTop) {
+Work _hashMapInsert(Task const& task, Records const& added, bool isTop) {
     auto const table = std::make_shared<Table>();
     auto const base = std::make_shared<Table>();
-    if (onTop) {
+    if (isTop) {
         for (Plain const& record : task.records()) base->emplace(record.key, record.data);
     }
     return Work::prepared([table, base] { *table = *base; },
@@ -526,23 +526,23 @@ struct Goals {
 
 void _inserts(bench::Report& report, Task const& task, std::string const& name, double goal) {
     // Each insert looks through all records, so of many only the last thousand are measured.
-    bool const onTop = task.records().size() > 10000;
-    std::string const row = name + (onTop ? ", 1,000 inserts more (each)" : ", inserts (each)");
+    bool const isTop = task.records().size() > 10000;
+    std::string const row = name + (isTop ? ", 1,000 more (each)" : ", inserts (each)");
     if (!report.wants(row)) return;
-    Records const added = onTop ? _records("another", 1000) : task.records();
-    report.compare(row, _ourInsert(task, added, onTop),
+    Records const added = isTop ? _records("another", 1000) : task.records();
+    report.compare(row, _ourInsert(task, added, isTop),
                    {
 #ifdef KORU_BENCH_HAS_LMDB
-                       bench::peer(Lmdb::name, _insert<Lmdb>(task, added, onTop)),
+                       bench::peer(Lmdb::name, _insert<Lmdb>(task, added, isTop)),
 #else
                        bench::missing("LMDB"),
 #endif
 #ifdef KORU_BENCH_HAS_SQLITE
-                       bench::peer(Sqlite::name, _insert<Sqlite>(task, added, onTop)),
+                       bench::peer(Sqlite::name, _insert<Sqlite>(task, added, isTop)),
 #else
                        bench::missing("SQLite"),
 #endif
-                       bench::limit("unordered_map", _hashMapInsert(task, added, onTop))},
+                       bench::limit("unordered_map", _hashMapInsert(task, added, isTop))},
                    goal, static_cast<double>(added.size()));
 }
 

@@ -10,6 +10,7 @@ namespace Koru {
 
 namespace {
 
+// NOLINTNEXTLINE(performance-no-int-to-ptr): it is no address, only all bits set.
 void* const FAILED = reinterpret_cast<void*>(static_cast<std::intptr_t>(-1));
 
 } // namespace

@@ -42,7 +42,7 @@ std::size_t _existingLength(std::string const& path, std::size_t known) {
 /// what exists through the system, the rest appended as it is, since most files that a program
 /// writes do not exist yet.
 std::string _resolveBelow(std::string const& path, std::size_t prefix) {
-    std::string const whole = _resolve(path);
+    std::string whole = _resolve(path);
     if (!whole.empty()) return whole;
     std::size_t const existing = _existingLength(path, prefix == 0 ? 0 : prefix - 1);
     std::string const start = path[0] == '/' ? "/" : ".";

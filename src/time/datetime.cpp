@@ -251,7 +251,7 @@ public:
     Order(DateTime const& a, DateTime const& b) {
         if (a.hasFieldsOf(b)) return;
         if (a.hasRegularFields() && b.hasRegularFields()) {
-            difference_ = _days(a) - _days(b);
+            difference_ = days(a) - days(b);
             // No zone ever shifted by more than two days, and a day beyond the end of its month is
             // three days later at the most.
             constexpr int beyondDoubt = 7;
@@ -267,7 +267,7 @@ public:
 
 private:
     /// Days as if every month had 31.
-    static int _days(DateTime const& value) {
+    static int days(DateTime const& value) {
         return (value.year_ * 12 + value.month_) * 31 + value.day_;
     }
 

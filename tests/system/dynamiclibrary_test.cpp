@@ -165,7 +165,7 @@ std::string Watched::calls;
 /// An object's virtual table, and a function in it called.
 void* const* tableOf(DynamicLibrary const& library) {
     void* const* table = nullptr;
-    std::memcpy(&table, &library, sizeof table);
+    std::memcpy(&table, static_cast<void const*>(&library), sizeof table);
     return table;
 }
 bool callSlot(DynamicLibrary& library, int slot) {

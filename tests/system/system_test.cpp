@@ -69,7 +69,7 @@ extern "C" int gethostname(char* buffer, std::size_t length) noexcept {
     host->buffersWereZero = host->buffersWereZero &&
                             std::all_of(buffer, buffer + length, [](char c) { return c == '\0'; });
     // What a failing call leaves in the buffer is not to be used.
-    std::memcpy(buffer, host->name.data(), std::min(length, host->name.size()));
+    std::copy_n(host->name.data(), std::min(length, host->name.size()), buffer);
     if (host->hasName) return 0;
     errno = EPERM;
     return -1;
@@ -359,6 +359,7 @@ namespace {
 /// one file take the first.
 struct Operation {
     char const* label;
+    bool hasTarget;
     std::function<bool(std::wstring const&, std::wstring const&)> system;
     std::function<bool(std::wstring const&, std::wstring const&)> file;
 };
@@ -366,15 +367,15 @@ struct Operation {
 std::vector<Operation> operations() {
     using Name = std::wstring const&;
     return {
-        {"exists", [](Name a, Name) { return System::existsFile(a); },
+        {"exists", false, [](Name a, Name) { return System::existsFile(a); },
          [](Name a, Name) { return File::exists(a); }},
-        {"rename", [](Name a, Name b) { return System::renameFile(a, b); },
+        {"rename", true, [](Name a, Name b) { return System::renameFile(a, b); },
          [](Name a, Name b) { return File::rename(a, b); }},
-        {"remove", [](Name a, Name) { return System::deleteFile(a); },
+        {"remove", false, [](Name a, Name) { return System::deleteFile(a); },
          [](Name a, Name) { return File::remove(a); }},
-        {"copy", [](Name a, Name b) { return System::copyFile(a, b); },
+        {"copy", true, [](Name a, Name b) { return System::copyFile(a, b); },
          [](Name a, Name b) { return File::copy(a, b); }},
-        {"create", [](Name a, Name) { return System::createFile(a); },
+        {"create", false, [](Name a, Name) { return System::createFile(a); },
          [](Name a, Name) { return File::create(a); }},
     };
 }
@@ -426,22 +427,28 @@ std::string stateOf(test::TempDir const& directory) {
 } // namespace
 
 TEST_CASE("the operations on files do what those of File do, whatever is in their way") {
-    std::wstring const names[] = {
-        L"full",     L"other",           L"empty",
-        L"readonly", L"gr\u00F6\u00DFe", L"link",
-        L"dangling", L"directory",       L"occupied",
-        L"missing",  L"missing/x",       L"full/x",
-        L"",         L"directory/new",   std::wstring(L"full\0ignored", 12),
+    std::wstring const sources[] = {
+        L"full",
+        L"readonly",
+        L"gr\u00F6\u00DFe",
+        L"link",
+        L"dangling",
+        L"directory",
+        L"occupied",
+        L"missing",
+        L"full/x",
+        L"",
+        std::wstring(L"full\0ignored", 12),
+    };
+    std::wstring const targets[] = {
+        L"other", L"full", L"dangling", L"directory", L"directory/new", L"missing/x", L"",
     };
     int done = 0;
     int succeeded = 0;
     for (Operation const& operation : operations()) {
-        for (std::wstring const& from : names) {
-            for (std::wstring const& to : names) {
-                // The second name is for operations on two files; one will do for the others.
-                bool const two = std::strcmp(operation.label, "rename") == 0 ||
-                                 std::strcmp(operation.label, "copy") == 0;
-                if (!two && &to != &names[0]) break;
+        for (std::wstring const& from : sources) {
+            for (std::wstring const& to : targets) {
+                if (!operation.hasTarget && &to != &targets[0]) break;
                 CAPTURE(operation.label);
                 CAPTURE(Koru::make_string(from));
                 CAPTURE(Koru::make_string(to));
@@ -449,18 +456,19 @@ TEST_CASE("the operations on files do what those of File do, whatever is in thei
                 test::TempDir const byFile;
                 fill(bySystem);
                 fill(byFile);
-                bool const result =
-                    operation.system(bySystem.wide("") + from, bySystem.wide("") + to);
-                CHECK(result == operation.file(byFile.wide("") + from, byFile.wide("") + to));
+                std::wstring const system = bySystem.wide("");
+                std::wstring const file = byFile.wide("");
+                bool const result = operation.system(system + from, system + to);
+                CHECK(result == operation.file(file + from, file + to));
                 CHECK(stateOf(bySystem) == stateOf(byFile));
                 ++done;
                 if (result) ++succeeded;
             }
         }
     }
-    CHECK(done == 3 * 15 + 2 * 15 * 15);
-    CHECK(succeeded > 100);
-    CHECK(succeeded < done - 100);
+    CHECK(done == 3 * 11 + 2 * 11 * 7);
+    CHECK(succeeded > 40);
+    CHECK(succeeded < done - 40);
 }
 
 TEST_CASE("the operations on files do nothing for a name that is empty") {

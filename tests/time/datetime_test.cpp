@@ -308,6 +308,20 @@ std::string textModel(Fields const& fields) {
     return std::string(date) + ((fields.parts & BOTH) == BOTH ? " " : "") + time;
 }
 
+/// Keeps the first of the differences that a loop finds.
+class FirstDifference {
+public:
+    void check(std::string const& label, std::string const& actual, std::string const& expected) {
+        if (actual == expected || !text_.empty()) return;
+        text_.append(label).append(": ").append(actual).append(", not ").append(expected);
+    }
+    /// Empty if there was none.
+    std::string const& text() const { return text_; }
+
+private:
+    std::string text_;
+};
+
 /// Of two numbers, or values: which of the six comparisons hold.
 template <class T>
 std::string comparisons(T const& a, T const& b) {
@@ -324,6 +338,7 @@ std::string comparisons(T const& a, T const& b) {
 /// Compares every value with every other one, and gives what was wrong first.
 std::string firstMiscomparison(std::vector<DateTime> const& values) {
     std::vector<long> moments;
+    moments.reserve(values.size());
     for (DateTime const& value : values) moments.push_back(secondsModel(fieldsOf(value)));
     calls = Calls();
     for (std::size_t i = 0; i < values.size(); ++i) {
@@ -794,7 +809,7 @@ TEST_CASE("a broken-down time costs mktime once, and with a time of day gmtime a
 
 TEST_CASE("any broken-down time becomes what the model makes of it") {
     Random random(101);
-    std::string wrong;
+    FirstDifference wrong;
     for (char const* const text : ZONES) {
         Zone const zone(text);
         for (int i = 0; i < 600; ++i) {
@@ -807,13 +822,11 @@ TEST_CASE("any broken-down time becomes what the model makes of it") {
             time.tm_sec = random.below(300) - 20;
             time.tm_isdst = random.below(3) - 1;
             unsigned int const parts = static_cast<unsigned int>(random.below(0x400));
-            std::string const actual = shown(DateTime(time, parts));
-            std::string const expected = modelOf(time, parts).shown();
-            if (actual != expected && wrong.empty()) wrong = actual + ", not " + expected;
+            wrong.check(text, shown(DateTime(time, parts)), modelOf(time, parts).shown());
             calls = Calls();
         }
     }
-    CHECK(wrong == "");
+    CHECK(wrong.text() == "");
 }
 
 // ================================================================================== from seconds
@@ -911,7 +924,7 @@ TEST_CASE("any moment of 32 bits becomes what the model makes of localtime's ans
     // Those around changes of summer time, and those where the C library has no later or earlier.
     static long const edges[] = {0,          1111885200, 1130634000, 1112511600, 1130652000,
                                  1110697200, 1131256800, 1096128000, 1112454000, 951782400};
-    std::string wrong;
+    FirstDifference wrong;
     for (char const* const text : ZONES) {
         CAPTURE(text);
         Zone const zone(text);
@@ -919,11 +932,7 @@ TEST_CASE("any moment of 32 bits becomes what the model makes of localtime's ans
             unsigned int const parts = static_cast<unsigned int>(random.below(4));
             std::tm const local = *std::localtime(static_cast<std::time_t const*>(&moment));
             std::string const actual = shown(DateTime(moment, parts));
-            std::string const expected = modelOf(local, parts).shown();
-            if (actual != expected && wrong.empty()) {
-                wrong = std::string(text) + ' ' + std::to_string(moment) + ": " + actual +
-                        ", not " + expected;
-            }
+            wrong.check(std::to_string(moment), actual, modelOf(local, parts).shown());
             calls = Calls();
         };
         for (int i = 0; i < 700; ++i) {
@@ -938,7 +947,7 @@ TEST_CASE("any moment of 32 bits becomes what the model makes of localtime's ans
             check(i - 2);
         }
     }
-    CHECK(wrong == "");
+    CHECK(wrong.text() == "");
 }
 
 TEST_CASE("seconds that become a value become the same seconds again") {
@@ -1293,7 +1302,7 @@ TEST_CASE("any text is read as the model reads it") {
         "2005-03-17 19:45:58", "2005-03-17",          "19:45:58",
         "0000-00-00 00:00:00", "00:0-:1-05 12:34:56", "01:02:03 xx12:34:56"};
     Random random(104);
-    std::string wrong;
+    FirstDifference wrong;
     int accepted = 0;
     for (int i = 0; i < 100000; ++i) {
         std::string input = random.of(patterns);
@@ -1307,13 +1316,10 @@ TEST_CASE("any text is read as the model reads it") {
         if (input.empty()) input = "-";
         auto const parts = static_cast<unsigned int>(random.below(4));
         std::string const actual = readFrom(input, parts);
-        std::string const expected = modelOf(input, parts);
         accepted += actual.find("offset 0") != std::string::npos;
-        if (actual != expected && wrong.empty()) {
-            wrong = '"' + input + "\": " + actual + ", not " + expected;
-        }
+        wrong.check(input, actual, modelOf(input, parts));
     }
-    CHECK(wrong == "");
+    CHECK(wrong.text() == "");
     CHECK(accepted > 25000);
     CHECK(accepted < 95000);
 }
