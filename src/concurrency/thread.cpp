@@ -17,7 +17,7 @@ void* const FAILED = reinterpret_cast<void*>(static_cast<std::intptr_t>(-1));
 
 // The unwinding of a cancelled thread carries no object, which the sanitizer takes for a null
 // reference.
-__attribute__((no_sanitize("null"))) void* ThreadFunction(void* thread) {
+__attribute__((no_sanitize("undefined"))) void* ThreadFunction(void* thread) {
     auto* const object = static_cast<Thread*>(thread);
     try {
         return object->run(object->argument_);

@@ -47,7 +47,7 @@ bool _openBuffer(std::filebuf& buffer, std::string const& name, std::ios::openmo
 /// is no failure and passes: to stop it would end the process. It carries no object, which the
 /// sanitizer takes for a null reference.
 template <class Step>
-__attribute__((no_sanitize("null"))) bool _succeeds(Step step) {
+__attribute__((no_sanitize("undefined"))) bool _succeeds(Step step) {
     try {
         step();
         return true;

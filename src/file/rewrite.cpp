@@ -4,7 +4,7 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <new>
+#include <exception>
 #include <stdexcept>
 #include <string>
 
@@ -68,9 +68,10 @@ void rewrite(File& file, Content& content) {
         // what is longer than the new content.
         if (!File::remove(wideName)) static_cast<void>(::truncate(name.c_str(), 0) == 0);
         file.File::open(mode);
-    } catch (std::bad_alloc const&) {
-        // Between the old file and the new one there is no memory for a stream. The content is at
-        // hand, so it goes to the disk all the same.
+    } catch (std::exception const&) {
+        // Mostly the old file's place is gone. But it may be that between the old file and the new
+        // one there is no memory for a stream, which the C library does not tell from any other
+        // reason. The content is at hand, so it goes to the disk all the same.
         _save(name, content);
         throw;
     }

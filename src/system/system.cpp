@@ -50,7 +50,8 @@ std::wstring System::getIpHostName() {
 std::wstring System::getIpAddress() {
     HostName const name;
     hostent const* const entry = name.entry();
-    if (entry == nullptr || entry->h_addr_list == nullptr || entry->h_addr_list[0] == nullptr) return std::wstring();
+    if (entry == nullptr || entry->h_addr_list == nullptr || entry->h_addr_list[0] == nullptr)
+        return std::wstring();
     in_addr address;
     std::memcpy(&address, entry->h_addr_list[0], sizeof address);
     return make_wstring(::inet_ntoa(address));

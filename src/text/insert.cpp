@@ -27,7 +27,7 @@ void _setBad(std::ostream& os) {
 /// one by one: the first that fails makes the stream bad, and the next after that makes it fail.
 /// The unwinding of a cancelled thread carries no object, which the sanitizer takes for a null
 /// reference.
-__attribute__((no_sanitize("null"))) void _passThrough(std::ostream& os, char const* s,
+__attribute__((no_sanitize("undefined"))) void _passThrough(std::ostream& os, char const* s,
                                                        char const* last) {
     bool onlyLast = false;
     try {
