@@ -28,7 +28,7 @@ void _setBad(std::ostream& os) {
 /// The unwinding of a cancelled thread carries no object, which the sanitizer takes for a null
 /// reference.
 __attribute__((no_sanitize("undefined"))) void _passThrough(std::ostream& os, char const* s,
-                                                       char const* last) {
+                                                            char const* last) {
     bool onlyLast = false;
     try {
         onlyLast = os.rdbuf()->sputn(s, last - s) == last - s;
