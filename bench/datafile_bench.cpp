@@ -68,8 +68,6 @@ std::vector<Koru::DataFile::Record> _ourRecords(Records const& records) {
 
 class Ours {
 public:
-    static constexpr char const* name = "ours";
-
     explicit Ours(std::string const& path) : file_(Koru::File::Path(path)) {}
     ~Ours() { file_.setMode(Koru::File::READ); } // so that nothing is written
     Ours(Ours const&) = delete;
