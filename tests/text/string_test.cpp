@@ -1097,9 +1097,7 @@ TEST_CASE("compare follows each change of the C locale") {
             CHECK(Koru::compare(L"I", L"\u0131") == 0);
         }
         if (name == "de_DE.ISO-8859-1") {
-            // The strcasecmp that sanitizers put in place knows the letters of ASCII only.
-            bool const same = Koru::compare("\xC9t\xC9", "\xE9T\xE9") == 0;
-            CHECK(same == !KORU_TEST_SANITIZED);
+            CHECK(Koru::compare("\xC9t\xC9", "\xE9T\xE9") == 0);
         }
     }
 }
