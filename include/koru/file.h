@@ -3,6 +3,7 @@
 #ifndef KORU_FILE_H
 #define KORU_FILE_H
 
+#include <atomic>
 #include <fstream>
 #include <iosfwd>
 #include <string>
@@ -22,8 +23,9 @@ extern KORU_EXPORT wchar_t const _COLON;
 /// A narrow file stream with a wide name, a remembered open mode, a recursive lock and the static
 /// operations on whole files.
 ///
-/// The lock serialises `open`, `close`, `synchronize` and the operations of derived classes; the
-/// stream operations inherited from `std::fstream` do not take it. An object that several threads
+/// The lock serialises `open`, `close`, `synchronize` and the operations of derived classes.
+/// `getMode`, `setMode` and `getName` do not take it and may be called at any time. The stream
+/// operations inherited from `std::fstream` do not take it either: an object that several threads
 /// write to directly is guarded with `lock` and `unlock`.
 ///
 /// Stream errors show in the stream's state, as with any stream. `open` clears the state only when
@@ -42,7 +44,7 @@ public:
     File();
 
     /// A closed file. The name is kept verbatim and reaches the system as UTF-8 (`make_string`).
-    explicit File(std::wstring const& name);
+    File(std::wstring const& name);
 
     File(File const&) = delete;
     File& operator=(File const&) = delete;
@@ -53,7 +55,8 @@ public:
     /// Opens the file. `READ` opens an existing file; `WRITE` creates the file or empties an
     /// existing one; `READ | WRITE` opens an existing file with its content, or creates it.
     /// On a file that is already open only the remembered mode changes: the file stays open as it
-    /// was and the stream's fail state is set.
+    /// was and the stream's fail state is set. A file that is there is not emptied by
+    /// `READ | WRITE`, whatever keeps it from being opened.
     /// @throws std::runtime_error "failed to open file."; it is closed then, the mode unchanged.
     ///         Also for a mode with neither `READ` nor `WRITE`.
     // LogFile hides this operation on purpose; GCC reports that here, Clang there.
@@ -62,8 +65,12 @@ public:
     virtual void open(unsigned long mode);
 #pragma GCC diagnostic pop
 
+    /// A stream's open mode would pass for a number: `std::ios::ate` is the value of `WRITE`.
+    void open(std::ios_base::openmode) = delete;
+
     /// Writes out what is buffered, closes the file and resets the mode to 0. Where writing out
-    /// fails, the stream's fail state is set; likewise on a file that is not open.
+    /// fails, the stream's fail state is set; likewise on a file that is not open. A thread that is
+    /// cancelled while it writes out has closed the file, and what was still buffered is lost.
     /// @throws std::runtime_error "failed to close file."; it is open then, the mode unchanged
     virtual void close();
 
@@ -75,7 +82,8 @@ public:
     /// The mode of the last successful `open`; 0 before it and after `close`.
     virtual unsigned long getMode() const;
 
-    /// Sets the remembered mode, which takes effect with the next `synchronize`.
+    /// Sets the remembered mode, which takes effect with the next `synchronize`; a structured file
+    /// looks at it in `close` and in the destructor too.
     virtual void setMode(unsigned long mode);
 
     /// Takes the file's recursive lock, waiting without limit (polling, see `Mutex::lock`).
@@ -113,7 +121,7 @@ public:
 
 private:
     std::wstring name_;
-    unsigned long mode_;
+    std::atomic<unsigned long> mode_;
     Mutex lock_;
 };
 

@@ -1,10 +1,11 @@
 #include <koru/thread.h>
 
-#include <cxxabi.h>
 #include <sys/select.h>
 #include <sys/time.h>
 
 #include <cstdint>
+
+#include "concurrency/cancellation.h"
 
 namespace Koru {
 
@@ -15,17 +16,9 @@ void* const FAILED = reinterpret_cast<void*>(static_cast<std::intptr_t>(-1));
 
 } // namespace
 
-// The unwinding of a cancelled thread carries no object, which the sanitizer takes for a null
-// reference.
-__attribute__((no_sanitize("undefined"))) void* ThreadFunction(void* thread) {
+void* ThreadFunction(void* thread) {
     auto* const object = static_cast<Thread*>(thread);
-    try {
-        return object->run(object->argument_);
-    } catch (abi::__forced_unwind const&) {
-        throw; // To stop it would end the process.
-    } catch (...) {
-        return FAILED;
-    }
+    return attempt([object] { return object->run(object->argument_); }, [] { return FAILED; });
 }
 
 Thread::Thread()

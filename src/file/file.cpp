@@ -1,17 +1,18 @@
 #include <koru/file.h>
 
-#include <cxxabi.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdio>
 #include <locale>
 #include <stdexcept>
 
 #include <koru/string.h>
 
+#include "concurrency/cancellation.h"
 #include "file/fileguard.h"
-#include "file/quiet.h"
+#include "file/openbuffer.h"
 
 namespace Koru {
 
@@ -32,32 +33,6 @@ std::ios::openmode _openMode(unsigned long mode) {
     return result;
 }
 
-/// Opens the buffer and tells whether that went well. Where memory for it runs out the standard
-/// library leaves the file open without a buffer; it is closed then.
-bool _openBuffer(std::filebuf& buffer, std::string const& name, std::ios::openmode mode) {
-    try {
-        return buffer.open(name, mode) != nullptr;
-    } catch (...) {
-        buffer.close();
-        throw;
-    }
-}
-
-/// Runs a step and tells whether it went without an exception. The unwinding of a cancelled thread
-/// is no failure and passes: to stop it would end the process. It carries no object, which the
-/// sanitizer takes for a null reference.
-template <class Step>
-__attribute__((no_sanitize("undefined"))) bool _succeeds(Step step) {
-    try {
-        step();
-        return true;
-    } catch (abi::__forced_unwind const&) {
-        throw;
-    } catch (...) {
-        return false;
-    }
-}
-
 } // namespace
 
 File::File() : mode_(0) {}
@@ -74,44 +49,56 @@ void File::open(unsigned long mode) {
     FileGuard const guard(*this);
     std::string const name = make_string(name_);
     std::ios::openmode const openMode = _openMode(mode);
-    if (!_openBuffer(*rdbuf(), name, openMode)) setstate(std::ios::failbit);
-    if (!is_open() && (mode & WRITE) != 0) {
+    errno = 0;
+    bool const opened = openBuffer(*rdbuf(), name, openMode);
+    // Nothing else is a reason to truncate: a file may well be there when a descriptor or memory is
+    // lacking, or when a signal or the disk came in between.
+    bool const missing = !is_open() && errno == ENOENT;
+    if (!opened) setstate(std::ios::failbit);
+    if (missing && (mode & WRITE) != 0) {
         // The stream's mode for update does not create a file; the one for truncation does.
-        if (_openBuffer(*rdbuf(), name, openMode | std::ios::trunc))
+        if (openBuffer(*rdbuf(), name, openMode | std::ios::trunc))
             clear();
         else
             setstate(std::ios::failbit);
     }
     // Intended: a file that was open already stays open as it was, and takes the new mode.
     if (!is_open()) throw std::runtime_error("failed to open file.");
-    mode_ = mode;
+    mode_.store(mode, std::memory_order_relaxed);
 }
 
 void File::close() {
     FileGuard const guard(*this);
     if (rdbuf()->close() == nullptr) setstate(std::ios::failbit);
     if (is_open()) throw std::runtime_error("failed to close file.");
-    mode_ = 0;
+    mode_.store(0, std::memory_order_relaxed);
 }
 
 void File::synchronize() {
     FileGuard const guard(*this);
     if (!is_open()) return;
-    unsigned long const mode = mode_;
+    unsigned long const mode = File::getMode();
     close();
     open(mode);
 }
 
-unsigned long File::getMode() const { return mode_; }
+unsigned long File::getMode() const { return mode_.load(std::memory_order_relaxed); }
 
-void File::setMode(unsigned long mode) { mode_ = mode; }
+void File::setMode(unsigned long mode) { mode_.store(mode, std::memory_order_relaxed); }
 
 bool File::lock() {
-    return _succeeds([this] { lock_.lock(WAIT_WITHOUT_LIMIT); });
+    return attempt(
+        [this] {
+            lock_.lock(WAIT_WITHOUT_LIMIT);
+            return true;
+        },
+        [] { return false; });
 }
 
+// Nothing can be thrown here.
 bool File::unlock() {
-    return _succeeds([this] { lock_.unlock(); });
+    lock_.unlock();
+    return true;
 }
 
 std::wstring File::getName() const { return name_; }

@@ -10,8 +10,6 @@
 
 #include <koru/string.h>
 
-#include "file/quiet.h"
-
 namespace Koru {
 
 namespace {
@@ -27,9 +25,17 @@ bool _write(int descriptor, std::string_view block) {
     return true;
 }
 
+/// Creates the file, or empties it.
+int _create(std::string const& name) {
+    for (;;) {
+        int const descriptor = ::open(name.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
+        if (descriptor >= 0 || errno != EINTR) return descriptor;
+    }
+}
+
 /// Writes the content without a stream, as far as the system takes it.
 void _save(std::string const& name, Content& content) {
-    int const descriptor = ::open(name.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0666);
+    int const descriptor = _create(name);
     if (descriptor < 0) return;
     for (std::string_view block = content.next(); !block.empty(); block = content.next()) {
         if (!_write(descriptor, block)) break;
@@ -57,8 +63,6 @@ void _write(File& file, Content& content) {
 } // namespace
 
 void rewrite(File& file, Content& content) {
-    // A cancelled thread ends before or after this, but not between the old file and the new one.
-    CancellationOff const guard;
     unsigned long const mode = file.getMode();
     std::wstring const wideName = file.getName();
     std::string const name = make_string(wideName);

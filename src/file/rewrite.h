@@ -6,6 +6,7 @@
 
 #include <koru/file.h>
 
+#include "concurrency/cancellation.h"
 #include "file/fileguard.h"
 
 namespace Koru {
@@ -20,13 +21,19 @@ public:
     virtual std::string_view next() = 0;
 };
 
-/// Opens the file, discards what was held in memory and loads the file if the mode says so.
+/// Opens the file, discards what was held in memory and loads the file if the mode says so. A
+/// cancellation leaves the mode 0: the destructor, which the same unwinding may call next, would
+/// write what was loaded so far over the file.
 template <class Discard, class Load>
 void openAndLoad(File& file, unsigned long mode, Discard discard, Load load) {
     FileGuard const guard(file);
-    file.File::open(mode);
-    discard();
-    if ((file.getMode() & File::READ) != 0) load();
+    undoIfCancelled(
+        [&] {
+            file.File::open(mode);
+            discard();
+            if ((file.getMode() & File::READ) != 0) load();
+        },
+        [&file] { file.File::setMode(0); });
 }
 
 /// Deletes the file and writes it anew with the mode of now; it is open afterwards.
@@ -35,10 +42,12 @@ void rewrite(File& file, Content& content);
 
 /// Writes the file anew if the mode says so, then discards what was held in memory and closes.
 /// `prepare` gives the content, ready to be written, before the old file is touched: what fails for
-/// want of memory fails while the old file is still there.
+/// want of memory fails while the old file is still there. A cancelled thread ends before or after
+/// this, but not between the old file and the new one, nor between that and the empty memory.
 template <class Prepare, class Discard>
 void writeBackAndClose(File& file, Prepare prepare, Discard discard) {
     FileGuard const guard(file);
+    CancellationOff const cancellationOff;
     if ((file.getMode() & File::WRITE) != 0) {
         auto content = prepare();
         rewrite(file, content);

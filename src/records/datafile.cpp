@@ -5,7 +5,7 @@
 
 #include <koru/string.h>
 
-#include "file/quiet.h"
+#include "concurrency/cancellation.h"
 #include "file/rewrite.h"
 #include "records/recordfile.h"
 #include "records/recordset.h"

@@ -6,6 +6,8 @@
 
 #include <koru/string.h>
 
+#include "file/openbuffer.h"
+
 namespace Koru {
 
 // For callers who take its address; the value stands in the header.
@@ -35,7 +37,7 @@ void LogFile::open(unsigned int mode) {
     // Intended: the mode is not set again, and without WRITE the append open fails.
     std::ios::openmode const append =
         (mode & WRITE) != 0 ? std::ios::out | std::ios::app : std::ios::openmode{};
-    if (rdbuf()->open(name, append) != nullptr) return;
+    if (openBuffer(*rdbuf(), name, append)) return;
     setstate(std::ios::failbit);
     _report(name);
     throw std::runtime_error("failed to open file.");

@@ -4,7 +4,7 @@
 
 #include <koru/string.h>
 
-#include "file/quiet.h"
+#include "concurrency/cancellation.h"
 #include "file/rewrite.h"
 #include "settings/load.h"
 #include "settings/render.h"
