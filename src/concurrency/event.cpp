@@ -23,16 +23,16 @@ private:
     pthread_mutex_t& mutex_;
 };
 
-/// The moment so many seconds from now, or the last one that a time_t holds.
-timespec _deadline(unsigned long seconds) {
+/// Finds the moment so many seconds from now, or the last one that a time_t holds.
+/// @return false where the present does not fit a timeval, as on 32 bits after January 2038
+bool _findDeadline(unsigned long seconds, timespec& deadline) {
     timeval now;
-    ::gettimeofday(&now, nullptr);
-    timespec deadline;
+    if (::gettimeofday(&now, nullptr) != 0) return false;
     constexpr time_t last = std::numeric_limits<time_t>::max();
     auto const left = static_cast<unsigned long>(last - now.tv_sec);
     deadline.tv_sec = seconds < left ? now.tv_sec + static_cast<time_t>(seconds) : last;
     deadline.tv_nsec = now.tv_usec * 1000;
-    return deadline;
+    return true;
 }
 
 } // namespace
@@ -60,7 +60,8 @@ int Event::wait(unsigned long timeout) {
         ::pthread_cond_wait(&condition_, &mutex_);
         return 0;
     }
-    timespec const deadline = _deadline(timeout);
+    timespec deadline;
+    if (!_findDeadline(timeout, deadline)) return -1;
     switch (::pthread_cond_timedwait(&condition_, &mutex_, &deadline)) {
     case 0:
         return 0;

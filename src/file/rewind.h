@@ -8,11 +8,9 @@ namespace Koru {
 
 /// Flushes the stream, clears its state and goes to the start of the file. What has no start, a
 /// pipe, is read from where it is.
-inline void rewind(File& file) {
-    file.flush();
-    file.clear();
-    file.rdbuf()->pubseekpos(0, std::ios::in);
-}
+/// @throws std::runtime_error "failed to read from file" where output that is still buffered cannot
+///         be written, or the file cannot be gone back in: it would look empty
+void rewind(File& file);
 
 } // namespace Koru
 

@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <cstring>
+#include <exception>
 #include <memory>
 #include <string_view>
 
@@ -15,13 +16,13 @@ namespace Koru {
 struct FileBytes {
     std::unique_ptr<char[]> data;
     std::size_t size = 0;
-    bool whole = true; ///< false where an error, not the end of the file, came after them
-
-    std::string_view view() const { return std::string_view(data.get(), size); }
+    std::exception_ptr failure; ///< what came after them in place of the file's end; mostly null
 };
 
-/// Flushes the stream, clears its state and reads the file from its start to its end. Leaves the
-/// stream as a peek at the end does.
+/// Flushes the stream, clears its state and reads the file from its start to its end, or up to what
+/// failed: an error, which throws where the caller enabled the stream's exceptions, or want of
+/// memory. Leaves the stream as a peek at the end does.
+/// @throws what `rewind` throws
 FileBytes readBytes(File& file);
 
 /// Calls `use` with every line that is not empty. Only a line feed ends a line; after an error the
@@ -33,7 +34,7 @@ void eachLine(FileBytes const& bytes, Use use) {
     while (at != end) {
         auto const left = static_cast<std::size_t>(end - at);
         auto const* const feed = static_cast<char const*>(std::memchr(at, '\n', left));
-        if (feed == nullptr && !bytes.whole) return;
+        if (feed == nullptr && bytes.failure != nullptr) return;
         char const* const stop = feed == nullptr ? end : feed;
         if (stop != at) use(std::string_view(at, static_cast<std::size_t>(stop - at)));
         at = feed == nullptr ? end : feed + 1;
