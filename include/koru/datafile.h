@@ -39,7 +39,7 @@ public:
     DataFile();
 
     /// A closed file without records.
-    explicit DataFile(File::Path const& path);
+    DataFile(File::Path const& path);
 
     DataFile(DataFile const&) = delete;
     DataFile& operator=(DataFile const&) = delete;
@@ -56,6 +56,8 @@ public:
     ///         where reading fails; std::invalid_argument "zero length key" for an entry without a
     ///         key. The file is open then, and the entries before that one are held.
     void open(unsigned long mode) override;
+    /// As in `File`: no stream's open mode.
+    void open(std::ios_base::openmode) = delete;
 
     /// When the mode has `WRITE`: deletes the file and writes all records to a new one. In any case
     /// destroys the records and closes the file. Without `WRITE` changes are lost silently.

@@ -22,7 +22,7 @@ class KORU_EXPORT Event {
 public:
     /// Starts not signalled.
     /// @param autoReset  whether a `test` that reads true makes the event not signalled again
-    explicit Event(bool autoReset);
+    Event(bool autoReset);
 
     Event(Event const&) = delete;
     Event& operator=(Event const&) = delete;
@@ -38,7 +38,8 @@ public:
     /// @param timeout  whole seconds (`Mutex::lock` counts milliseconds); 0xFFFFFFFF, the default,
     ///                 waits without limit, as does an argument with all bits set. A moment that
     ///                 `time_t` cannot express is replaced by the last one that it can.
-    /// @return 0 when woken, 1 when the time ran out, -1 when the wait failed otherwise
+    /// @return 0 when woken, 1 when the time ran out, -1 when the wait failed otherwise or the
+    ///         present does not fit a `timeval`, as in 32-bit programs after January 2038
     int wait(unsigned long timeout = 0xFFFFFFFFUL);
 
     /// Lowers the flag.

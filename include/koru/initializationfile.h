@@ -46,7 +46,7 @@ public:
     InitializationFile();
 
     /// A closed file with an empty table.
-    explicit InitializationFile(File::Path const& path);
+    InitializationFile(File::Path const& path);
 
     InitializationFile(InitializationFile const&) = delete;
     InitializationFile& operator=(InitializationFile const&) = delete;
@@ -60,6 +60,8 @@ public:
     /// @throws std::runtime_error "failed to read from file"; the file stays open, the table holds
     ///         what was read
     void open(unsigned long mode) override;
+    /// As in `File`: no stream's open mode.
+    void open(std::ios_base::openmode) = delete;
 
     /// When the mode has `WRITE`: sorts the table, deletes the file and writes it anew. In any case
     /// empties the table and closes the file. Without `WRITE` changes are lost silently.

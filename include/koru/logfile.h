@@ -28,7 +28,7 @@ public:
     LogFile();
 
     /// A closed file.
-    explicit LogFile(File::Path const& path);
+    LogFile(File::Path const& path);
 
     LogFile(LogFile const&) = delete;
     LogFile& operator=(LogFile const&) = delete;

@@ -42,7 +42,7 @@ public:
     PropertyFile();
 
     /// A closed file with an empty list.
-    explicit PropertyFile(File::Path const& path);
+    PropertyFile(File::Path const& path);
 
     PropertyFile(PropertyFile const&) = delete;
     PropertyFile& operator=(PropertyFile const&) = delete;
@@ -56,6 +56,8 @@ public:
     /// @throws std::runtime_error "failed to read from file"; the file stays open, the list holds
     ///         what was read
     void open(unsigned long mode) override;
+    /// As in `File`: no stream's open mode.
+    void open(std::ios_base::openmode) = delete;
 
     /// When the mode has `WRITE`: deletes the file and writes it anew. In any case empties the list
     /// and closes the file. Without `WRITE` changes are lost silently.

@@ -224,7 +224,7 @@ std::size_t slotOf(Member member) {
 } // namespace
 
 TEST_CASE("the virtual operations keep their order behind the two entries of the destructor") {
-    CHECK(slotOf(&DataFile::open) == 2);
+    CHECK(slotOf(static_cast<void (DataFile::*)(unsigned long)>(&DataFile::open)) == 2);
     CHECK(slotOf(&DataFile::close) == 3);
     CHECK(slotOf(&DataFile::synchronize) == 4);
     CHECK(slotOf(&DataFile::getMode) == 5);

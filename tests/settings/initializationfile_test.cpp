@@ -91,7 +91,8 @@ std::size_t slotOf(Member member) {
 } // namespace
 
 TEST_CASE("the virtual operations keep their order behind the two entries of the destructor") {
-    CHECK(slotOf(&InitializationFile::open) == 2);
+    CHECK(slotOf(static_cast<void (InitializationFile::*)(unsigned long)>(
+              &InitializationFile::open)) == 2);
     CHECK(slotOf(&InitializationFile::close) == 3);
     CHECK(slotOf(&InitializationFile::synchronize) == 4);
     CHECK(slotOf(&InitializationFile::getMode) == 5);

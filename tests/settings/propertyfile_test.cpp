@@ -431,7 +431,7 @@ std::size_t slotOf(Member member) {
 } // namespace
 
 TEST_CASE("the virtual operations keep their order behind the two entries of the destructor") {
-    CHECK(slotOf(&PropertyFile::open) == 2);
+    CHECK(slotOf(static_cast<void (PropertyFile::*)(unsigned long)>(&PropertyFile::open)) == 2);
     CHECK(slotOf(&PropertyFile::close) == 3);
     CHECK(slotOf(&PropertyFile::synchronize) == 4);
     CHECK(slotOf(&PropertyFile::getMode) == 5);
