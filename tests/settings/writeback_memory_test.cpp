@@ -1,14 +1,8 @@
-// The sectioned settings file when memory runs out. A file of its own, since the operators that
-// allocate memory are replaced for the whole executable and the libraries it loaded.
+// The sectioned settings file when memory runs out.
 #include <doctest/doctest.h>
 
-#include <unistd.h>
-
-#include <atomic>
 #include <cstddef>
-#include <cstdlib>
 #include <memory>
-#include <new>
 #include <stdexcept>
 #include <string>
 #include <thread>
@@ -17,6 +11,7 @@
 
 #include <koru/initializationfile.h>
 
+#include "support/failingmemory.h"
 #include "support/settingsfixture.h"
 #include "support/settingsmodel.h"
 #include "support/subprocess.h"
@@ -24,88 +19,24 @@
 
 using Koru::InitializationFile;
 using test::drain;
+using test::Failing;
+using test::memoryRanOut;
 using test::READ;
 using test::READ_WRITE;
+using test::runOutOfMemory;
 using test::Setting;
 using test::Settings;
 using test::SettingsPlace;
 using test::SettingsTableModel;
+using test::Watchdog;
 using test::WRITE;
 
 namespace {
-
-enum class Failing { ONE, ONE_AND_ALL_LATER };
-
-std::atomic<long> allocationsBeforeFailure{-1}; // -1: none fails
-std::atomic<bool> laterOnesFail{false};
-std::atomic<long> failures{0};
-
-void* _allocate(std::size_t size) noexcept {
-    if (allocationsBeforeFailure >= 0 && allocationsBeforeFailure-- == 0) {
-        ++failures;
-        if (laterOnesFail) allocationsBeforeFailure = 0;
-        return nullptr;
-    }
-    return std::malloc(size == 0 ? 1 : size);
-}
-
-void* _allocateOrThrow(std::size_t size) {
-    void* const memory = _allocate(size);
-    if (memory == nullptr) throw std::bad_alloc();
-    return memory;
-}
-
-/// Lets allocation number `before` (from 0) fail while the callable runs, and says how that ended:
-/// "done", "std::bad_alloc" or another exception's message.
-template <class Callable>
-std::string runOutOfMemory(long before, Failing failing, Callable callable) {
-    std::string outcome = "done"; // short enough to need no memory
-    failures = 0;
-    laterOnesFail = failing == Failing::ONE_AND_ALL_LATER;
-    allocationsBeforeFailure = before;
-    try {
-        callable();
-        allocationsBeforeFailure = -1;
-    } catch (std::bad_alloc const&) {
-        allocationsBeforeFailure = -1;
-        outcome = "std::bad_alloc";
-    } catch (std::exception const& e) {
-        allocationsBeforeFailure = -1;
-        outcome = e.what();
-    }
-    return outcome;
-}
-
-bool memoryRanOut() { return failures > 0; }
-
-/// Ends the process when a test hangs on a lock that was not given back.
-class Watchdog {
-public:
-    Watchdog() { ::alarm(200); }
-    Watchdog(Watchdog const&) = delete;
-    Watchdog& operator=(Watchdog const&) = delete;
-    ~Watchdog() { ::alarm(0); }
-};
 
 /// Lets another thread use the file, which it can when the lock is free.
 void useFromAnotherThread(InitializationFile& file) {
     std::thread([&file] { file.getValue(L"s", L"k"); }).join();
 }
-
-} // namespace
-
-void* operator new(std::size_t size) { return _allocateOrThrow(size); }
-void* operator new[](std::size_t size) { return _allocateOrThrow(size); }
-void* operator new(std::size_t size, std::nothrow_t const&) noexcept { return _allocate(size); }
-void* operator new[](std::size_t size, std::nothrow_t const&) noexcept { return _allocate(size); }
-void operator delete(void* memory) noexcept { std::free(memory); }
-void operator delete[](void* memory) noexcept { std::free(memory); }
-void operator delete(void* memory, std::size_t) noexcept { std::free(memory); }
-void operator delete[](void* memory, std::size_t) noexcept { std::free(memory); }
-void operator delete(void* memory, std::nothrow_t const&) noexcept { std::free(memory); }
-void operator delete[](void* memory, std::nothrow_t const&) noexcept { std::free(memory); }
-
-namespace {
 
 /// A file's bytes, and what is set in it before it is written back.
 struct Edit {

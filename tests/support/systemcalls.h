@@ -1,0 +1,165 @@
+// The system's calls that files are made of, as this executable and the libraries it loaded make
+// them: a test can have them fail, transfer less than they are asked for, or cancel the thread that
+// makes them. To be included by one source file of an executable.
+#ifndef KORU_TESTS_SYSTEMCALLS_H
+#define KORU_TESTS_SYSTEMCALLS_H
+
+#include <dlfcn.h>
+#include <pthread.h>
+#include <sys/syscall.h>
+#include <sys/uio.h>
+#include <unistd.h>
+
+#include <array>
+#include <atomic>
+#include <cerrno>
+#include <cstdarg>
+#include <cstddef>
+#include <cstdio>
+
+namespace test {
+
+enum class Call { OPEN, READ, WRITE, SEEK };
+
+/// What the calls of one kind do besides their work.
+struct CallPlan {
+    std::atomic<long> before{-1}; ///< so many succeed before one fails; -1: none fails
+    std::atomic<int> error{0};
+    std::atomic<bool> forever{false}; ///< whether all later ones fail too
+    std::atomic<long> made{0};
+};
+
+inline std::array<CallPlan, 4> callPlans;
+
+inline CallPlan& planOf(Call call) { return callPlans[static_cast<std::size_t>(call)]; }
+
+/// Calls that are cancellation points cancel the calling thread when this many have been made.
+inline thread_local long callsBeforeCancellation = -1;
+
+/// What the system says is to come when it is asked; -1: the truth.
+inline std::atomic<int> claimedSize{-1};
+
+// A sanitizer has a malloc of its own, in whose place no other can be put.
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool MALLOC_CAN_FAIL = false;
+#else
+constexpr bool MALLOC_CAN_FAIL = true;
+#endif
+
+/// For how many of the streams that this thread opens next the C library gets no memory.
+inline thread_local int streamsWithoutMemory = 0;
+inline thread_local bool opensStream = false;
+
+/// Lets one kind of calls fail within a scope, after some that succeed.
+class FailingCall {
+public:
+    enum Times { ONCE, FOR_EVER };
+
+    FailingCall(Call call, int error, long before = 0, Times times = ONCE) : plan_(planOf(call)) {
+        plan_.error = error;
+        plan_.forever = times == FOR_EVER;
+        plan_.made = 0;
+        plan_.before = before;
+    }
+    FailingCall(FailingCall const&) = delete;
+    FailingCall& operator=(FailingCall const&) = delete;
+    ~FailingCall() { plan_.before = -1; }
+
+    /// The calls made since.
+    long made() const { return plan_.made; }
+
+private:
+    CallPlan& plan_;
+};
+
+/// Whether a call fails now, with errno set.
+inline bool failsNow(Call call) {
+    CallPlan& plan = planOf(call);
+    ++plan.made;
+    if (plan.before < 0 || plan.before-- > 0) return false;
+    if (plan.forever) plan.before = 0;
+    errno = plan.error;
+    return true;
+}
+
+/// Counts a cancellation point and cancels the thread when it is its turn.
+inline void passCancellationPoint() {
+    if (callsBeforeCancellation >= 0 && callsBeforeCancellation-- == 0)
+        ::pthread_cancel(::pthread_self());
+    ::pthread_testcancel();
+}
+
+template <class Function>
+Function realFunction(char const* name) {
+    return reinterpret_cast<Function>(::dlsym(RTLD_NEXT, name));
+}
+
+/// The opening of a stream; a file that is to be read on.
+inline FILE* openStream(char const* function, char const* name, char const* mode) {
+    passCancellationPoint();
+    if (failsNow(Call::OPEN)) return nullptr;
+    auto const open = realFunction<FILE* (*)(char const*, char const*)>(function);
+    opensStream = streamsWithoutMemory > 0;
+    if (opensStream) --streamsWithoutMemory;
+    FILE* const stream = open(name, mode);
+    opensStream = false;
+    return stream;
+}
+
+} // namespace test
+
+extern "C" FILE* fopen(char const* name, char const* mode) {
+    return test::openStream("fopen", name, mode);
+}
+
+extern "C" FILE* fopen64(char const* name, char const* mode) {
+    return test::openStream("fopen64", name, mode);
+}
+
+extern "C" ssize_t read(int fd, void* buffer, size_t count) {
+    test::passCancellationPoint();
+    if (test::failsNow(test::Call::READ)) return -1;
+    return test::realFunction<ssize_t (*)(int, void*, size_t)>("read")(fd, buffer, count);
+}
+
+extern "C" ssize_t write(int fd, void const* buffer, size_t count) {
+    test::passCancellationPoint();
+    if (test::failsNow(test::Call::WRITE)) return -1;
+    return test::realFunction<ssize_t (*)(int, void const*, size_t)>("write")(fd, buffer, count);
+}
+
+extern "C" ssize_t writev(int fd, iovec const* pieces, int count) {
+    test::passCancellationPoint();
+    if (test::failsNow(test::Call::WRITE)) return -1;
+    return test::realFunction<ssize_t (*)(int, iovec const*, int)>("writev")(fd, pieces, count);
+}
+
+extern "C" off64_t lseek64(int fd, off64_t offset, int whence) noexcept {
+    if (test::failsNow(test::Call::SEEK)) return -1;
+    return test::realFunction<off64_t (*)(int, off64_t, int)>("lseek64")(fd, offset, whence);
+}
+
+extern "C" int ioctl(int fd, unsigned long request, ...) noexcept {
+    va_list arguments;
+    va_start(arguments, request);
+    void* const argument = va_arg(arguments, void*);
+    va_end(arguments);
+    int const claimed = test::claimedSize;
+    if (claimed >= 0) {
+        *static_cast<int*>(argument) = claimed;
+        return 0;
+    }
+    return static_cast<int>(::syscall(SYS_ioctl, fd, request, argument));
+}
+
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
+extern "C" void* __libc_malloc(size_t size); // NOLINT(bugprone-reserved-identifier)
+
+extern "C" void* malloc(size_t size) noexcept {
+    if (!test::opensStream) return __libc_malloc(size);
+    errno = ENOMEM;
+    return nullptr;
+}
+#endif
+
+#endif
