@@ -43,6 +43,18 @@ thread_local TimedWait timedWait;
 } // namespace
 
 // Stands before the C library's function, so that tests see the deadline and make the wait fail.
+namespace {
+
+bool clockFails = false;
+
+} // namespace
+
+extern "C" int gettimeofday(timeval* now, void* zone) noexcept {
+    if (!clockFails) return static_cast<int>(::syscall(SYS_gettimeofday, now, zone));
+    errno = EOVERFLOW;
+    return -1;
+}
+
 extern "C" int pthread_cond_timedwait(pthread_cond_t* condition, pthread_mutex_t* mutex,
                                       timespec const* deadline) {
     ++timedWait.calls;
@@ -439,6 +451,18 @@ TEST_CASE("a deadline that does not fit time_t becomes the last second that does
         CHECK(timedWait.deadline.tv_nsec < 1000000000);
         timedWait = TimedWait();
     }
+}
+
+TEST_CASE("a wait fails where the present does not fit a timeval, as on 32 bits after 2038") {
+    Koru::Event event(true);
+    event.signal();
+    clockFails = true;
+    timedWait = TimedWait();
+    int const result = event.wait(1);
+    clockFails = false;
+    CHECK(result == -1);
+    CHECK(timedWait.calls == 0);
+    CHECK(event.test()); // the event is as it was, its mutex free
 }
 
 TEST_CASE("a deadline that just fits time_t is kept") {
