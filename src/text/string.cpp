@@ -87,15 +87,31 @@ std::wstring make_wstring(wchar_t const* s) {
 
 std::string make_string(wchar_t const* s) { return make_string(make_wstring(s)); }
 
+std::wstring wideString(wchar_t const* s, std::size_t size) {
+    constexpr std::size_t worthwhile = 128; // Beyond it, filling the string first takes longer.
+    if (size > worthwhile) return std::wstring(s, size);
+    std::wstring result(size, L'\0');
+    std::memcpy(&result[0], s, size * sizeof *s);
+    return result;
+}
+
 namespace {
+
+/// Whether a text is ASCII without a NUL and no longer than most names. For that a block is not
+/// worth its while.
+template <class Char>
+bool _isPlainName(Char const* s, Char const* end) {
+    return end - s <= 16 && std::all_of(s, end, [](Char c) { return c > 0 && c <= 0x7F; });
+}
 
 /// Decodes text without zero bytes.
 std::wstring _decode(char const* s, char const* end) {
     if (s == end) return _null_wstring;
+    if (_isPlainName(s, end)) return std::wstring(s, end);
     bool const shuffle = canShuffle();
     wchar_t block[BLOCK];
     wchar_t* filled = decodeBlock(s, end, block, shuffle);
-    if (s == end) return std::wstring(block, filled);
+    if (s == end) return wideString(block, static_cast<std::size_t>(filled - block));
     std::wstring result;
     result.reserve(static_cast<std::size_t>(filled - block) +
                    countLeads(s, static_cast<std::size_t>(end - s)));
@@ -121,6 +137,7 @@ std::string make_string(std::wstring const& text) {
     wchar_t const* s = text.data();
     wchar_t const* const end = s + text.size();
     if (s == end) return _null_string;
+    if (_isPlainName(s, end)) return std::string(s, end);
     bool const shuffle = canShuffle();
     char block[BLOCK];
     char* filled = encodeBlock(s, end, block, shuffle);

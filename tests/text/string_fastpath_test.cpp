@@ -370,6 +370,21 @@ TEST_CASE("the public conversions follow the plain rule at every size up to thre
     }
 }
 
+TEST_CASE("a short name with an odd unit at any place is converted by the plain rule") {
+    for (std::size_t size = 1; size <= 18; ++size) {
+        for (std::size_t place = 0; place < size; ++place) {
+            for (wchar_t c = -300; c <= 300; ++c) {
+                std::wstring text(size, L'x');
+                text[place] = c;
+                CHECK((Koru::make_string(text) == encodePlainly(text)));
+                std::string bytes(size, 'x');
+                bytes[place] = static_cast<char>(c);
+                CHECK((Koru::make_wstring(bytes) == decodePlainly(bytes)));
+            }
+        }
+    }
+}
+
 TEST_CASE("a NUL ends the text in any step and any block") {
     for (std::size_t before = 0; before <= 2 * Koru::BLOCK; before += before < 70 ? 1 : 37) {
         for (wchar_t const filler : {L'x', L'\u00E9', L'\u4E2D', L'\U0001F600'}) {
