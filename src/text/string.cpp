@@ -89,9 +89,13 @@ std::string make_string(wchar_t const* s) { return make_string(make_wstring(s));
 
 std::wstring wideString(wchar_t const* s, std::size_t size) {
     constexpr std::size_t worthwhile = 128; // Beyond it, filling the string first takes longer.
-    if (size > worthwhile) return std::wstring(s, size);
-    std::wstring result(size, L'\0');
-    std::memcpy(&result[0], s, size * sizeof *s);
+    std::wstring result;
+    if (size > worthwhile) {
+        result.append(s, size);
+    } else {
+        result.resize(size);
+        std::copy(s, s + size, result.begin());
+    }
     return result;
 }
 
@@ -101,7 +105,7 @@ namespace {
 /// worth its while.
 template <class Char>
 bool _isPlainName(Char const* s, Char const* end) {
-    return end - s <= 16 && std::all_of(s, end, [](Char c) { return c > 0 && c <= 0x7F; });
+    return end - s < 16 && std::all_of(s, end, [](Char c) { return c > 0 && c <= 0x7F; });
 }
 
 /// Decodes text without zero bytes.
