@@ -59,14 +59,19 @@ struct FourPairs {
     __m128i disputed; ///< I and i
 };
 
-/// How many characters, in steps of four, two texts are sure to have in common, case aside.
+/// How many characters two texts are sure to have in common, case aside; the last three are not
+/// looked at.
 std::size_t _commonPrefix(wchar_t const* a, wchar_t const* b, std::size_t size) {
     __m128i disputed = _mm_setzero_si128();
     std::size_t i = 0;
     for (; size - i >= 4; i += 4) {
         FourPairs const pairs(load16(a + i), load16(b + i));
-        if (highBits(pairs.same) != ALL_BYTES) break;
         disputed = _mm_or_si128(disputed, pairs.disputed);
+        std::uint32_t const others = highBits(pairs.same) ^ ALL_BYTES;
+        if (others != 0) {
+            i += static_cast<std::size_t>(__builtin_ctz(others)) / sizeof *a;
+            break;
+        }
     }
     bool const agreed = highBits(disputed) == 0 || lower(L'I') == L'i';
     return agreed ? i : 0;
@@ -75,6 +80,10 @@ std::size_t _commonPrefix(wchar_t const* a, wchar_t const* b, std::size_t size) 
 } // namespace
 
 int compare(std::wstring const& a, std::wstring const& b) {
+    // Most names differ at once.
+    wchar_t const x = a.c_str()[0];
+    wchar_t const y = b.c_str()[0];
+    if (x != y && lower(x) != lower(y)) return static_cast<int>(lower(x) - lower(y));
     std::size_t const common = _commonPrefix(a.data(), b.data(), std::min(a.size(), b.size()));
     return compareFolded(WideCursor(a.c_str() + common), WideCursor(b.c_str() + common));
 }
