@@ -201,6 +201,11 @@ __attribute__((target("ssse3"))) Progress _decodeMixed(Progress at, char const* 
     std::uint32_t owed = 0;
     for (; end - at.s >= STEP + 2 && full - at.to >= STEP; at.s += STEP) {
         __m128i const bytes = load16(at.s);
+        if (owed == 0 && highBits(bytes) == 0) {
+            _widen16(bytes, at.to);
+            at.to += STEP;
+            continue;
+        }
         Shape const shape(bytes);
         std::uint32_t const asked = owed | shape.asked();
         if ((asked & ALL_BYTES) != shape.tails || shape.leadsOfMore != 0) break;

@@ -154,6 +154,14 @@ inline __m128i _formsOfTwo(__m128i c) {
     return _either(_mm_cmpgt_epi16(c, _mm_set1_epi16(0x7F)), two, _mm_slli_epi16(c, 8));
 }
 
+/// Writes the forms of eight 16-bit characters from 1 to 0x7FF.
+__attribute__((target("ssse3"))) inline char* _encodeTwos(__m128i c, char* to) {
+    if (highBits(_mm_cmpgt_epi16(c, _mm_set1_epi16(0x7F))) != 0)
+        return _squeezeZeros(_formsOfTwo(c), to);
+    _mm_storel_epi64(reinterpret_cast<__m128i*>(to), _mm_packus_epi16(c, c));
+    return to + STEP / 2;
+}
+
 /// The forms of four characters below 0x200000, in four bytes each.
 inline __m128i _formsOfFour(__m128i c) {
     auto const above = [c](int limit, std::uint32_t marks) {
@@ -184,8 +192,7 @@ __attribute__((target("ssse3"))) inline char* _encodeHalfStep(__m128i a, __m128i
     __m128i const all = _mm_packs_epi32(a, b);
     __m128i const aboveZero = _mm_cmpgt_epi16(all, zero);
     __m128i const aboveTwo = _mm_cmpgt_epi16(all, _mm_set1_epi16(0x7FF));
-    if (_holdsEverywhere(_mm_andnot_si128(aboveTwo, aboveZero)))
-        return _squeezeZeros(_formsOfTwo(all), to);
+    if (_holdsEverywhere(_mm_andnot_si128(aboveTwo, aboveZero))) return _encodeTwos(all, to);
     __m128i const any = _mm_or_si128(a, b);
     __m128i const belowFour = _mm_cmpeq_epi32(_mm_srli_epi32(any, 16), zero);
     if (_holdsEverywhere(_mm_and_si128(aboveTwo, belowFour)))

@@ -253,6 +253,7 @@ TEST_CASE("decoding any three odd bytes at any place of a step follows the plain
             forEachTriple(odd, [&](std::string const& three) {
                 if (before % 3 == 0) checkDecoding(left + three);
                 checkDecoding(left + three + right);
+                if (before % 3 == 1) checkDecoding(left + three + std::string(33, 'x') + filler);
             });
         }
     }
@@ -285,6 +286,7 @@ TEST_CASE("encoding any three odd characters at any place of a step follows the 
             forEachTriple(odd, [&](std::wstring const& three) {
                 if (before % 3 == 0) checkEncoding(left + three);
                 checkEncoding(left + three + right);
+                if (before % 3 == 1) checkEncoding(left + three + std::wstring(17, L'x') + right);
             });
         }
     }
