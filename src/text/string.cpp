@@ -175,12 +175,27 @@ char* encode(wchar_t const* s, std::size_t size, char* to) {
     return to;
 }
 
+namespace {
+
+/// Writes the low 8 bits of each character to `to`.
+void _lowBytes(wchar_t const* s, std::size_t size, char* to) {
+    __m128i const byte = _mm_set1_epi32(0xFF);
+    auto const four = [s, byte](std::size_t i) { return _mm_and_si128(load16(s + i), byte); };
+    std::size_t i = 0;
+    for (; size - i >= 16; i += 16) {
+        store16(to + i, _mm_packus_epi16(_mm_packs_epi32(four(i), four(i + 4)),
+                                         _mm_packs_epi32(four(i + 8), four(i + 12))));
+    }
+    for (; i != size; ++i) to[i] = static_cast<char>(s[i]);
+}
+
+} // namespace
+
 std::ostream& operator<<(std::ostream& os, std::wstring const& s) {
     char block[BLOCK];
     for (std::size_t done = 0; done != s.size();) {
         std::size_t const size = std::min(s.size() - done, BLOCK);
-        std::transform(s.data() + done, s.data() + done + size, block,
-                       [](wchar_t c) { return static_cast<char>(c); });
+        _lowBytes(s.data() + done, size, block);
         insert(os, block, size);
         done += size;
     }

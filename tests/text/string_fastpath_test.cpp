@@ -15,6 +15,7 @@
 #include <cstring>
 #include <limits>
 #include <random>
+#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -494,5 +495,20 @@ TEST_CASE("comparing random text that is equal but for case, or nearly, follows 
         b[random() % b.size()] = corners[random() % corners.size()];
         checkComparison(a, b);
         checkComparison(a, b.substr(0, random() % b.size()));
+    }
+}
+
+TEST_CASE("the wide inserter writes the low 8 bits at every size up to three blocks") {
+    std::mt19937 random(6);
+    for (std::size_t size = 0; size <= 3 * Koru::BLOCK; size += size < 100 ? 1 : 29) {
+        std::wstring text;
+        std::string bytes;
+        while (text.size() < size) {
+            text += static_cast<wchar_t>(random());
+            bytes += static_cast<char>(text.back() & 0xFF);
+        }
+        std::ostringstream out;
+        Koru::operator<<(out, text);
+        CHECK((out.str() == bytes));
     }
 }
