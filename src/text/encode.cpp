@@ -4,6 +4,7 @@
 #include <array>
 #include <cstdint>
 #include <cstring>
+#include <cwchar>
 
 #include "text/convert.h"
 #include "text/simd.h"
@@ -265,11 +266,20 @@ std::size_t _sum(__m128i values) {
 } // namespace
 
 std::size_t encodedBound(wchar_t const* s, std::size_t size) {
+    wchar_t const* const start = s;
     wchar_t const* const end = s + size;
     __m128i further = _mm_setzero_si128();
+    __m128i lowest = _mm_set1_epi8(-1);
     for (; end - s >= STEP; s += STEP) {
-        if (_areAboveZero(_narrow16(s))) continue;
+        __m128i const bytes = _narrow16(s);
+        if (_areAboveZero(bytes)) continue;
+        lowest = _mm_min_epu8(lowest, bytes);
         further = _mm_sub_epi32(further, _furtherBytesOfStep(s));
+    }
+    if (highBits(_mm_cmpeq_epi8(lowest, _mm_setzero_si128())) != 0) {
+        // A NUL, behind which nothing is to be reserved, or a negative character.
+        std::size_t const length = ::wcsnlen(start, size);
+        if (length != size) return encodedBound(start, length);
     }
     for (; s != end; ++s) {
         further = _mm_sub_epi32(further, _furtherBytes(_mm_cvtsi32_si128(*s)));

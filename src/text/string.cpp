@@ -6,7 +6,9 @@
 #include <cstdint>
 #include <cstring>
 #include <cwchar>
+#include <new>
 #include <ostream>
+#include <stdexcept>
 
 #include "text/convert.h"
 #include "text/fold.h"
@@ -88,10 +90,17 @@ int compare(std::wstring const& a, std::wstring const& b) {
     return compareFolded(WideCursor(a.c_str() + common), WideCursor(b.c_str() + common));
 }
 
-std::string make_string(char const* s) { return length(s) == 0 ? _null_string : std::string(s); }
+// What is too long for any string is want of memory too: callers have one failure to know.
+std::string make_string(char const* s) try {
+    return length(s) == 0 ? _null_string : std::string(s);
+} catch (std::length_error const&) {
+    throw std::bad_alloc();
+}
 
-std::wstring make_wstring(wchar_t const* s) {
+std::wstring make_wstring(wchar_t const* s) try {
     return length(s) == 0 ? _null_wstring : std::wstring(s);
+} catch (std::length_error const&) {
+    throw std::bad_alloc();
 }
 
 std::string make_string(wchar_t const* s) { return make_string(make_wstring(s)); }
@@ -118,7 +127,7 @@ bool _isPlainName(Char const* s, Char const* end) {
 }
 
 /// Decodes text without zero bytes.
-std::wstring _decode(char const* s, char const* end) {
+std::wstring _decode(char const* s, char const* end) try {
     if (s == end) return _null_wstring;
     if (_isPlainName(s, end)) return std::wstring(s, end);
     bool const shuffle = canShuffle();
@@ -132,6 +141,8 @@ std::wstring _decode(char const* s, char const* end) {
         filled = decodeBlock(s, end, block, shuffle);
     }
     return result;
+} catch (std::length_error const&) {
+    throw std::bad_alloc();
 }
 
 } // namespace
@@ -146,7 +157,7 @@ std::wstring make_wstring(char const* s, std::size_t size) {
     return _decode(s, s + ::strnlen(s, size));
 }
 
-std::string make_string(std::wstring const& text) {
+std::string make_string(std::wstring const& text) try {
     wchar_t const* s = text.data();
     wchar_t const* const end = s + text.size();
     if (s == end) return _null_string;
@@ -162,6 +173,8 @@ std::string make_string(std::wstring const& text) {
         filled = encodeBlock(s, end, block, shuffle);
     }
     return result;
+} catch (std::length_error const&) {
+    throw std::bad_alloc();
 }
 
 char* encode(wchar_t const* s, std::size_t size, char* to) {

@@ -410,6 +410,18 @@ TEST_CASE("the bound is the size of the encoded text, or more where it ends earl
     }
 }
 
+TEST_CASE("the bound leaves out what stands behind a NUL, but for less than a step") {
+    for (wchar_t const c : {L'x', L'\u4E2D', wchar_t{-1}}) {
+        for (std::size_t before = 0; before <= 40; ++before) {
+            std::wstring const text(before, c);
+            std::size_t const bound = encodePlainly(text).size();
+            std::wstring const behind = L'\0' + std::wstring(500, L'\u4E2D');
+            CHECK(Koru::encodedBound((text + behind).data(), before + 501) >= bound);
+            CHECK(Koru::encodedBound((text + behind).data(), before + 501) < bound + 6 * 16);
+        }
+    }
+}
+
 TEST_CASE("the characters of well-formed text are counted") {
     std::mt19937 random(4);
     for (std::size_t size = 0; size <= 2000; size += size < 100 ? 1 : 61) {
