@@ -17,9 +17,9 @@ namespace Koru {
 /// A calendar date, a time of day with milliseconds and an offset from UTC, and a mask that says
 /// which of the two halves the value carries. A plain value.
 ///
-/// Conversions from and to epoch seconds, and with them some comparisons, use `localtime`, `gmtime`
-/// and `mktime` (POSIX), which share static storage: threads that convert at once serialise that.
-/// Everything else may be done from several threads at once.
+/// Construction from a `tm`, a `long` or a `timeval`, conversion to `long`, and with it some
+/// comparisons, use `localtime`, `gmtime` and `mktime` (POSIX), which share static storage: threads
+/// that do so at once serialise it. Everything else may be done from several threads at once.
 ///
 /// Intended: the offset takes part in nothing. Constructors derive it in whole hours, without the
 /// hour of daylight saving; `setOffset` takes minutes.
@@ -92,20 +92,9 @@ public:
     /// "YYYY-MM-DD HH:MM:SS" or the half that the value carries; empty when it carries none.
     operator std::string() const;
 
-    friend KORU_EXPORT bool operator==(DateTime const& a, DateTime const& b);
-    friend KORU_EXPORT bool operator<(DateTime const& a, DateTime const& b);
     friend KORU_EXPORT std::ostream& operator<<(std::ostream& os, DateTime const& value);
 
 private:
-    class Order;
-
-    void takeFields(std::tm const& time, unsigned int parts);
-    void readDate(std::string const& text);
-    void readTime(std::string const& text);
-    bool hasFieldsOf(DateTime const& other) const;
-    bool hasRegularFields() const;
-    char* format(char* to) const;
-
     std::uint16_t year_;
     std::uint8_t month_;
     std::uint8_t day_;

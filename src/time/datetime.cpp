@@ -60,6 +60,25 @@ void _check(bool inRange, char const* message) {
     if (!inRange) throw std::invalid_argument(message);
 }
 
+void _readDate(DateTime& value, std::string const& text) {
+    _check(_has(text, 4, '-') && _has(text, 7, '-'), "incorrect format.");
+    // Intended: a number of 0 is skipped.
+    if (long const year = _number<4>(text, 0)) value.setYear(static_cast<unsigned short>(year));
+    if (long const month = _number<2>(text, 5)) value.setMonth(static_cast<unsigned char>(month));
+    if (long const day = _number<2>(text, 8)) value.setDay(static_cast<unsigned char>(day));
+}
+
+void _readTime(DateTime& value, std::string const& text) {
+    std::size_t start = 0;
+    if (!_has(text, 2, ':') || !_has(text, 5, ':')) {
+        start = 11;
+        _check(_has(text, 13, ':') && _has(text, 16, ':'), "incorrect format.");
+    }
+    value.setHour(static_cast<unsigned char>(_number<2>(text, start)));
+    value.setMinute(static_cast<unsigned char>(_number<2>(text, start + 3)));
+    value.setSecond(static_cast<unsigned char>(_number<2>(text, start + 6)));
+}
+
 /// Writes a number with leading zeros; a wider one is not cut.
 char* _put(char* to, unsigned int number, unsigned int width) {
     unsigned int digits = width;
@@ -76,6 +95,23 @@ char* _put(char* to, char c) {
 
 constexpr std::size_t LONGEST_TEXT = sizeof "65535-255-255 255:255:255";
 
+/// Writes the given parts of a value and returns the end of what was written.
+char* _format(DateTime const& value, unsigned int parts, char* to) {
+    if ((parts & DateTime::DATE) != 0) {
+        to = _put(_put(to, value.getYear(), 4), '-');
+        to = _put(_put(to, value.getMonth(), 2), '-');
+        to = _put(to, value.getDay(), 2);
+    }
+    unsigned int const both = DateTime::DATE | DateTime::TIME;
+    if ((parts & both) == both) to = _put(to, ' ');
+    if ((parts & DateTime::TIME) != 0) {
+        to = _put(_put(to, value.getHour(), 2), ':');
+        to = _put(_put(to, value.getMinute(), 2), ':');
+        to = _put(to, value.getSecond(), 2);
+    }
+    return to;
+}
+
 } // namespace
 
 DateTime::DateTime()
@@ -83,25 +119,6 @@ DateTime::DateTime()
       parts_(DATE | TIME) {}
 
 DateTime::DateTime(std::tm const& time, unsigned int parts) : DateTime() {
-    takeFields(time, parts);
-}
-
-DateTime::DateTime(long seconds, unsigned int parts) : DateTime() {
-    takeFields(_localTime(seconds), parts);
-}
-
-DateTime::DateTime(timeval const& time, unsigned int parts)
-    : DateTime(static_cast<long>(time.tv_sec), parts) {
-    millisecond_ = static_cast<std::uint32_t>(time.tv_usec / 1000);
-}
-
-DateTime::DateTime(std::string const& text, unsigned int parts) : DateTime() {
-    if ((parts & DATE) != 0) readDate(text);
-    if ((parts & TIME) != 0) readTime(text);
-    parts_ = static_cast<std::uint8_t>(parts);
-}
-
-void DateTime::takeFields(std::tm const& time, unsigned int parts) {
     std::tm copy = time;
     if ((parts & DATE) != 0) {
         year_ = static_cast<std::uint16_t>(static_cast<unsigned int>(time.tm_year) + 1900U);
@@ -119,23 +136,17 @@ void DateTime::takeFields(std::tm const& time, unsigned int parts) {
     parts_ = static_cast<std::uint8_t>(parts);
 }
 
-void DateTime::readDate(std::string const& text) {
-    _check(_has(text, 4, '-') && _has(text, 7, '-'), "incorrect format.");
-    // Intended: a number of 0 is skipped.
-    if (long const year = _number<4>(text, 0)) setYear(static_cast<unsigned short>(year));
-    if (long const month = _number<2>(text, 5)) setMonth(static_cast<unsigned char>(month));
-    if (long const day = _number<2>(text, 8)) setDay(static_cast<unsigned char>(day));
+DateTime::DateTime(long seconds, unsigned int parts) : DateTime(_localTime(seconds), parts) {}
+
+DateTime::DateTime(timeval const& time, unsigned int parts)
+    : DateTime(static_cast<long>(time.tv_sec), parts) {
+    millisecond_ = static_cast<std::uint32_t>(time.tv_usec / 1000);
 }
 
-void DateTime::readTime(std::string const& text) {
-    std::size_t start = 0;
-    if (!_has(text, 2, ':') || !_has(text, 5, ':')) {
-        start = 11;
-        _check(_has(text, 13, ':') && _has(text, 16, ':'), "incorrect format.");
-    }
-    setHour(static_cast<unsigned char>(_number<2>(text, start)));
-    setMinute(static_cast<unsigned char>(_number<2>(text, start + 3)));
-    setSecond(static_cast<unsigned char>(_number<2>(text, start + 6)));
+DateTime::DateTime(std::string const& text, unsigned int parts) : DateTime() {
+    if ((parts & DATE) != 0) _readDate(*this, text);
+    if ((parts & TIME) != 0) _readTime(*this, text);
+    parts_ = static_cast<std::uint8_t>(parts);
 }
 
 std::uint16_t DateTime::getYear() const { return year_; }
@@ -220,81 +231,64 @@ DateTime::operator long() const {
 
 DateTime::operator std::string() const {
     char text[LONGEST_TEXT];
-    return std::string(text, format(text));
-}
-
-char* DateTime::format(char* to) const {
-    if ((parts_ & DATE) != 0) {
-        to = _put(_put(to, year_, 4), '-');
-        to = _put(_put(to, month_, 2), '-');
-        to = _put(to, day_, 2);
-    }
-    if ((parts_ & (DATE | TIME)) == (DATE | TIME)) to = _put(to, ' ');
-    if ((parts_ & TIME) != 0) {
-        to = _put(_put(to, hour_, 2), ':');
-        to = _put(_put(to, minute_, 2), ':');
-        to = _put(to, second_, 2);
-    }
-    return to;
+    return std::string(text, _format(*this, parts_, text));
 }
 
 std::ostream& operator<<(std::ostream& os, DateTime const& value) {
     char text[LONGEST_TEXT];
-    insert(os, text, static_cast<std::size_t>(value.format(text) - text));
+    insert(os, text, static_cast<std::size_t>(_format(value, value.parts_, text) - text));
     return os;
 }
 
-/// How two values compare: by their epoch seconds, which take a conversion of each unless the
-/// fields decide beyond doubt.
-class DateTime::Order {
-public:
-    Order(DateTime const& a, DateTime const& b) {
-        if (a.hasFieldsOf(b)) return;
-        if (a.hasRegularFields() && b.hasRegularFields()) {
-            difference_ = days(a) - days(b);
-            // No zone ever shifted by more than two days, and a day beyond the end of its month is
-            // three days later at the most.
-            constexpr int beyondDoubt = 7;
-            if (difference_ >= beyondDoubt || difference_ <= -beyondDoubt) return;
-        }
-        long const secondsA = a;
-        long const secondsB = b;
-        difference_ = secondsA < secondsB ? -1 : secondsA > secondsB;
-    }
-
-    bool isEqual() const { return difference_ == 0; }
-    bool isLess() const { return difference_ < 0; }
-
-private:
-    /// Days as if every month had 31.
-    static int days(DateTime const& value) {
-        return (value.year_ * 12 + value.month_) * 31 + value.day_;
-    }
-
-    int difference_ = 0;
-};
+namespace {
 
 /// Whether the fields that a conversion looks at are the same.
-bool DateTime::hasFieldsOf(DateTime const& other) const {
-    return year_ == other.year_ && month_ == other.month_ && day_ == other.day_ &&
-           hour_ == other.hour_ && minute_ == other.minute_ && second_ == other.second_;
+bool _haveSameFields(DateTime const& a, DateTime const& b) {
+    return a.getYear() == b.getYear() && a.getMonth() == b.getMonth() && a.getDay() == b.getDay() &&
+           a.getHour() == b.getHour() && a.getMinute() == b.getMinute() &&
+           a.getSecond() == b.getSecond();
 }
 
 /// Whether the fields are a date and time that every time_t holds, in every zone.
-bool DateTime::hasRegularFields() const {
-    return year_ > 1902 && year_ < 2037 && month_ >= 1 && month_ <= 12 && day_ >= 1 && day_ <= 31 &&
-           hour_ <= 23 && minute_ <= 59 && second_ <= 59;
+bool _isRegular(DateTime const& value) {
+    return value.getYear() > 1902 && value.getYear() < 2037 && value.getMonth() >= 1 &&
+           value.getMonth() <= 12 && value.getDay() >= 1 && value.getDay() <= 31 &&
+           value.getHour() <= 23 && value.getMinute() <= 59 && value.getSecond() <= 59;
 }
 
-bool operator==(DateTime const& a, DateTime const& b) { return DateTime::Order(a, b).isEqual(); }
+/// Days as if every month had 31.
+int _days(DateTime const& value) {
+    return (value.getYear() * 12 + value.getMonth()) * 31 + value.getDay();
+}
+
+/// How two values compare, less than, equal to or greater than 0: by their epoch seconds, which
+/// take a conversion of the first and then of the second unless the fields decide beyond doubt.
+inline int _order(DateTime const& a, DateTime const& b) {
+    if (_haveSameFields(a, b)) return 0;
+    if (_isRegular(a) && _isRegular(b)) {
+        // Seven of these days are four of the calendar at least, where they lie across February,
+        // and so more than 72 hours from one time of day to any other. A zone is less than 25 hours
+        // from UTC (POSIX), so from the one moment to the other it shifts by less than 50.
+        constexpr int beyondDoubt = 7;
+        int const difference = _days(a) - _days(b);
+        if (difference >= beyondDoubt || difference <= -beyondDoubt) return difference;
+    }
+    long const secondsA = a;
+    long const secondsB = b;
+    return secondsA < secondsB ? -1 : secondsA > secondsB;
+}
+
+} // namespace
+
+bool operator==(DateTime const& a, DateTime const& b) { return _order(a, b) == 0; }
 
 bool operator!=(DateTime const& a, DateTime const& b) { return !(a == b); }
 
-bool operator<(DateTime const& a, DateTime const& b) { return DateTime::Order(a, b).isLess(); }
+bool operator<(DateTime const& a, DateTime const& b) { return _order(a, b) < 0; }
 
-bool operator<=(DateTime const& a, DateTime const& b) { return !(b < a); }
+bool operator<=(DateTime const& a, DateTime const& b) { return !(a > b); }
 
-bool operator>(DateTime const& a, DateTime const& b) { return b < a; }
+bool operator>(DateTime const& a, DateTime const& b) { return _order(a, b) > 0; }
 
 bool operator>=(DateTime const& a, DateTime const& b) { return !(a < b); }
 

@@ -114,10 +114,10 @@ private:
 
 char const CENTRAL_EUROPE[] = "CET-1CEST,M3.5.0,M10.5.0/3";
 char const NEW_YORK[] = "EST5EDT,M3.2.0,M11.1.0";
-/// Summer time is two days later than winter time, which is as far as it goes.
-char const EXTREME[] = "AAA24BBB-24,M3.5.0,M10.5.0";
+/// Summer time is two days and two hours later than winter time, which is as far as it goes.
+char const EXTREME[] = "AAA24:59:59BBB-24:59:59,M3.5.0,M10.5.0";
 /// The same on 28 February, where a month is shortest.
-char const EXTREME_FEBRUARY[] = "AAA24BBB-24,J59/0,J300";
+char const EXTREME_FEBRUARY[] = "AAA24:59:59BBB-24:59:59,J59/0,J300";
 
 char const* const ZONES[] = {
     "UTC0",
@@ -1776,6 +1776,26 @@ TEST_CASE("a comparison asks mktime for no more than two conversions, and nothin
     calls = Calls();
 }
 
+TEST_CASE("a comparison converts its first value first, whichever it is") {
+    DateTime const a = valueOf(2005, 3, 7);
+    DateTime const b = valueOf(2005, 3, 8);
+    auto const days = [](auto compare) {
+        calls = Calls();
+        compare();
+        std::string result;
+        for (std::tm const& time : calls.mktime) result += std::to_string(time.tm_mday) + ' ';
+        calls = Calls();
+        return result;
+    };
+    CHECK(days([&] { return a == b; }) == "7 8 ");
+    CHECK(days([&] { return a != b; }) == "7 8 ");
+    CHECK(days([&] { return a < b; }) == "7 8 ");
+    CHECK(days([&] { return a <= b; }) == "7 8 ");
+    CHECK(days([&] { return a > b; }) == "7 8 ");
+    CHECK(days([&] { return a >= b; }) == "7 8 ");
+    CHECK(days([&] { return b > a; }) == "8 7 ");
+}
+
 TEST_CASE("values around the changes of summer time compare by their seconds") {
     for (char const* const text : ZONES) {
         CAPTURE(text);
@@ -1800,7 +1820,7 @@ TEST_CASE("values around the changes of summer time compare by their seconds") {
     }
 }
 
-TEST_CASE("values around changes of two days compare by their seconds") {
+TEST_CASE("values around changes of fifty hours compare by their seconds") {
     struct Row {
         char const* zone;
         int month;
