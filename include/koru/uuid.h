@@ -29,7 +29,8 @@ public:
     /// Reads the text form in lower or upper case; all zero for text that is refused.
     /// Intended: what is asked is 36 characters (up to the first NUL), hexadecimal digits and
     /// hyphens, and no hyphen among the last as many characters as there are hyphens. So the
-    /// hyphens may stand elsewhere, and of 36 digits without any the last four are ignored.
+    /// hyphens may stand elsewhere, and of 36 digits without any the last four are ignored; with
+    /// more than four hyphens fewer than 32 digits are enough, and the last are read twice.
     Uuid(std::string const& text);
 
     operator std::vector<unsigned char>() const;

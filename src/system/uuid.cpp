@@ -3,47 +3,85 @@
 #include <algorithm>
 #include <array>
 #include <cstddef>
-#include <cstdint>
 #include <cstring>
 #include <ostream>
 
-#include <koru/string.h>
-
 #include "text/insert.h"
+#include "text/simd.h"
 
 namespace Koru {
 
 namespace {
 
 constexpr std::size_t TEXT_SIZE = 36;
-constexpr char DIGITS[] = "0123456789abcdef";
 
 using Text = std::array<char, TEXT_SIZE>;
 
-constexpr std::uint8_t NO_DIGIT = 0xFF;
+/// Where the digits stand in the text form, four by four; before the third to the sixth of these
+/// there is a hyphen.
+constexpr std::array<std::size_t, 8> PLACES = {0, 4, 9, 14, 19, 24, 28, 32};
 
-constexpr std::array<std::uint8_t, 256> _makeValues() {
-    std::array<std::uint8_t, 256> values{};
-    for (auto& value : values) value = NO_DIGIT;
-    for (std::uint8_t i = 0; i < 10; ++i) values['0' + i] = i;
-    for (std::uint8_t i = 0; i < 6; ++i) {
-        values['a' + i] = values['A' + i] = static_cast<std::uint8_t>(10 + i);
-    }
-    return values;
+/// The digits of sixteen values from 0 to 15.
+__m128i _toDigits(__m128i values) {
+    __m128i const letters = _mm_cmpgt_epi8(values, _mm_set1_epi8(9));
+    return _mm_add_epi8(_mm_add_epi8(values, _mm_set1_epi8('0')),
+                        _mm_and_si128(letters, _mm_set1_epi8('a' - '0' - 10)));
 }
 
-/// The value of every hexadecimal digit.
-constexpr std::array<std::uint8_t, 256> VALUES = _makeValues();
-
 Text _format(unsigned char const (&bytes)[16]) {
+    __m128i const all = load16(bytes);
+    __m128i const high = _mm_and_si128(_mm_srli_epi16(all, 4), _mm_set1_epi8(0x0F));
+    __m128i const low = _mm_and_si128(all, _mm_set1_epi8(0x0F));
+    std::array<char, 32> digits;
+    store16(digits.data(), _toDigits(_mm_unpacklo_epi8(high, low)));
+    store16(digits.data() + 16, _toDigits(_mm_unpackhi_epi8(high, low)));
     Text text;
-    std::size_t at = 0;
-    for (std::size_t i = 0; i < 16; ++i) {
-        if (i == 4 || i == 6 || i == 8 || i == 10) text[at++] = '-';
-        text[at++] = DIGITS[bytes[i] >> 4];
-        text[at++] = DIGITS[bytes[i] & 0x0F];
+    text.fill('-');
+    for (std::size_t i = 0; i < PLACES.size(); ++i) {
+        std::memcpy(text.data() + PLACES[i], digits.data() + 4 * i, 4);
     }
     return text;
+}
+
+/// Where the characters are from one to another.
+__m128i _areFrom(char first, char last, __m128i c) {
+    return _mm_and_si128(_mm_cmpgt_epi8(c, _mm_set1_epi8(static_cast<char>(first - 1))),
+                         _mm_cmplt_epi8(c, _mm_set1_epi8(static_cast<char>(last + 1))));
+}
+
+/// Reads sixteen digits as eight bytes, if that is what they are.
+bool _read(__m128i c, unsigned char* to) {
+    __m128i const letters = _areFrom('a', 'f', _mm_or_si128(c, _mm_set1_epi8('a' ^ 'A')));
+    if (highBits(_mm_or_si128(_areFrom('0', '9', c), letters)) != ALL_BYTES) return false;
+    __m128i const values = _mm_add_epi8(_mm_and_si128(c, _mm_set1_epi8(0x0F)),
+                                        _mm_and_si128(letters, _mm_set1_epi8(9)));
+    __m128i const pairs = _mm_or_si128(_mm_slli_epi16(values, 4), _mm_srli_epi16(values, 8));
+    __m128i const bytes = _mm_and_si128(pairs, _mm_set1_epi16(0x00FF));
+    _mm_storel_epi64(reinterpret_cast<__m128i*>(to), _mm_packus_epi16(bytes, bytes));
+    return true;
+}
+
+/// Reads the text form.
+bool _readUsual(char const* text, unsigned char* to) {
+    if (text[8] != '-' || text[13] != '-' || text[18] != '-' || text[23] != '-') return false;
+    auto const four = [text](std::size_t i) {
+        int digits;
+        std::memcpy(&digits, text + PLACES[i], sizeof digits);
+        return digits;
+    };
+    return _read(_mm_setr_epi32(four(0), four(1), four(2), four(3)), to) &&
+           _read(_mm_setr_epi32(four(4), four(5), four(6), four(7)), to + 8);
+}
+
+/// Reads text with hyphens anywhere. Intended: what they leave free at the end keeps what stood
+/// there and has to be digits too.
+bool _readAnyhow(char const* text, unsigned char* to) {
+    Text digits;
+    std::copy_n(text, TEXT_SIZE, digits.data());
+    static_cast<void>(std::remove(digits.begin(), digits.end(), '-'));
+    std::array<unsigned char, 8> last;
+    return _read(load16(digits.data()), to) && _read(load16(digits.data() + 16), to + 8) &&
+           _read(load16(digits.data() + TEXT_SIZE - 16), last.data());
 }
 
 } // namespace
@@ -57,20 +95,11 @@ Uuid::Uuid(std::vector<unsigned char> const& bytes) : bytes_() {
 }
 
 Uuid::Uuid(std::string const& text) : bytes_() {
-    if (length(text) != TEXT_SIZE) return;
-    Text digits;
-    std::copy_n(text.data(), TEXT_SIZE, digits.data());
-    // Intended: hyphens anywhere. The last places keep what stood there and have to be digits too.
-    static_cast<void>(std::remove(digits.begin(), digits.end(), '-'));
-    std::array<std::uint8_t, TEXT_SIZE> values;
-    std::uint8_t all = 0;
-    for (std::size_t i = 0; i < TEXT_SIZE; ++i) {
-        values[i] = VALUES[static_cast<unsigned char>(digits[i])];
-        all |= values[i];
-    }
-    if (all == NO_DIGIT) return;
-    for (std::size_t i = 0; i < 16; ++i) {
-        bytes_[i] = static_cast<unsigned char>(values[2 * i] << 4 | values[2 * i + 1]);
+    // A NUL before the end of 36 characters is no digit.
+    if (text.size() < TEXT_SIZE || text.c_str()[TEXT_SIZE] != '\0') return;
+    std::array<unsigned char, 16> bytes;
+    if (_readUsual(text.data(), bytes.data()) || _readAnyhow(text.data(), bytes.data())) {
+        std::copy_n(bytes.data(), 16, bytes_);
     }
 }
 

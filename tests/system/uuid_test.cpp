@@ -378,6 +378,32 @@ TEST_CASE("text is read as a plain model reads it") {
     CHECK(accepted < 50000);
 }
 
+TEST_CASE("the usual form with any character in it, and any two, is read as the model reads it") {
+    std::string const odd = std::string("\0", 1) + "-0/9:@AFG`afg\x10\x19\x7f\x80\xb0\xe1\xff";
+    auto const check = [](std::string const& text) {
+        if (parsed(text) == modelOf(text)) return;
+        CAPTURE(text);
+        CHECK(shown(parsed(text)) == shown(modelOf(text)));
+    };
+    for (std::size_t at = 0; at < 36; ++at) {
+        std::string text = TEXT;
+        for (int value = 0; value < 256; ++value) {
+            text[at] = static_cast<char>(value);
+            check(text);
+        }
+        for (std::size_t other = 0; other < 36; ++other) {
+            for (char const x : odd) {
+                for (char const y : odd) {
+                    text = TEXT;
+                    text[at] = x;
+                    text[other] = y;
+                    check(text);
+                }
+            }
+        }
+    }
+}
+
 TEST_CASE("16 bytes survive the way through the text and back") {
     std::mt19937 random(19680503);
     for (int round = 0; round < 5000; ++round) {
