@@ -1,6 +1,7 @@
 #include <koru/system.h>
 
 #include <fcntl.h>
+#include <pthread.h>
 #include <stdlib.h>
 #include <unistd.h>
 
@@ -17,25 +18,46 @@ namespace {
 constexpr std::size_t BUFFER_SIZE = 4096;
 static_assert(BUFFER_SIZE >= PATH_MAX, "realpath needs room for PATH_MAX bytes");
 
-/// Fills the buffer from the file and returns how much of it that took.
-std::size_t _read(int descriptor, char* buffer, std::size_t size) {
-    std::size_t filled = 0;
-    while (filled < size) {
-        ssize_t const n = ::read(descriptor, buffer + filled, size - filled);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) break;
-        filled += static_cast<std::size_t>(n);
+/// The process's command line, open. Its thread cannot be cancelled meanwhile: opening, reading and
+/// closing are points of cancellation, and to be cancelled in any of them would leave a descriptor
+/// behind, or end the process where the close is part of a destructor.
+class CommandLine {
+public:
+    CommandLine() {
+        ::pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &before_);
+        descriptor_ = ::open("/proc/self/cmdline", O_RDONLY | O_CLOEXEC);
     }
-    return filled;
-}
+    CommandLine(CommandLine const&) = delete;
+    CommandLine& operator=(CommandLine const&) = delete;
+    ~CommandLine() {
+        if (descriptor_ >= 0) ::close(descriptor_);
+        ::pthread_setcancelstate(before_, nullptr);
+    }
+
+    /// Fills the buffer up to a zero byte at least and returns how much of it that took.
+    std::size_t readString(char* buffer, std::size_t size) const {
+        std::size_t filled = 0;
+        while (filled < size) {
+            ssize_t const n = ::read(descriptor_, buffer + filled, size - filled);
+            if (n < 0 && errno == EINTR) continue;
+            if (n <= 0) break;
+            auto const arrived = static_cast<std::size_t>(n);
+            bool const ended = std::memchr(buffer + filled, '\0', arrived) != nullptr;
+            filled += arrived;
+            if (ended) break;
+        }
+        return filled;
+    }
+
+private:
+    int before_ = PTHREAD_CANCEL_ENABLE;
+    int descriptor_ = -1;
+};
 
 /// Reads argv[0]. The arguments are separated by zero bytes, so as a string the buffer ends with
 /// the first of them. Intended: it ends at the first blank too.
 void _readFirstArgument(char (&argument)[BUFFER_SIZE]) {
-    int const descriptor = ::open("/proc/self/cmdline", O_RDONLY | O_CLOEXEC);
-    if (descriptor < 0) return;
-    std::size_t const size = _read(descriptor, argument, BUFFER_SIZE - 1);
-    ::close(descriptor);
+    std::size_t const size = CommandLine().readString(argument, BUFFER_SIZE - 1);
     argument[size] = '\0';
     if (char* const blank = std::strchr(argument, ' ')) *blank = '\0';
 }
@@ -43,8 +65,9 @@ void _readFirstArgument(char (&argument)[BUFFER_SIZE]) {
 } // namespace
 
 std::wstring System::getProcessFileName() {
+    // Reading a file is a point of cancellation, so here is one.
+    ::pthread_testcancel();
     char argument[BUFFER_SIZE];
-    argument[0] = '\0';
     _readFirstArgument(argument);
     char resolved[BUFFER_SIZE];
     std::memset(resolved, 0, sizeof resolved);

@@ -5,9 +5,12 @@
 #include <koru/system.h>
 
 #include <fcntl.h>
+#include <pthread.h>
+#include <sched.h>
 #include <stdlib.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <array>
@@ -23,10 +26,37 @@
 
 #include <doctest/doctest.h>
 
+#include "support/cancellation.h"
 #include "support/relocate.h"
 #include "support/selfexec.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
+
+// Reading and closing, of this executable and the libraries it loaded, pass through here, so that a
+// test can have a thread cancelled in either.
+namespace {
+
+enum class CancelledIn { NOTHING, READ, CLOSE };
+thread_local CancelledIn cancelledIn = CancelledIn::NOTHING;
+
+void _cancelIn(CancelledIn call) {
+    if (cancelledIn != call) return;
+    cancelledIn = CancelledIn::NOTHING;
+    ::pthread_cancel(::pthread_self());
+    ::pthread_testcancel();
+}
+
+} // namespace
+
+extern "C" ssize_t read(int fd, void* buffer, size_t count) {
+    _cancelIn(CancelledIn::READ);
+    return static_cast<ssize_t>(::syscall(SYS_read, fd, buffer, count));
+}
+
+extern "C" int close(int fd) {
+    _cancelIn(CancelledIn::CLOSE);
+    return static_cast<int>(::syscall(SYS_close, fd));
+}
 
 namespace {
 
@@ -428,14 +458,51 @@ TEST_CASE("a process that can open no file has an empty name") {
           Strings{dir / "prog", "", dir / "prog"});
 }
 
+namespace {
+
+std::ptrdiff_t openFiles() {
+    std::filesystem::directory_iterator const first("/proc/self/fd");
+    return std::distance(begin(first), end(first));
+}
+
+} // namespace
+
 TEST_CASE("getProcessFileName leaves no file open") {
-    auto const descriptors = [] {
-        std::filesystem::directory_iterator const first("/proc/self/fd");
-        return std::distance(begin(first), end(first));
-    };
-    auto const before = descriptors();
+    auto const before = openFiles();
     for (int i = 0; i < 20; ++i) static_cast<void>(Koru::System::getProcessFileName());
-    CHECK(descriptors() == before);
+    CHECK(openFiles() == before);
+}
+
+TEST_CASE("a thread cancelled in getProcessFileName leaves no file open") {
+    for (CancelledIn const call : {CancelledIn::READ, CancelledIn::CLOSE}) {
+        CAPTURE(call == CancelledIn::READ);
+        auto const before = openFiles();
+        bool const cancelled = test::endsCancelled(
+            [call] {
+                cancelledIn = call;
+                static_cast<void>(Koru::System::getProcessFileName());
+                ::pthread_testcancel();
+            },
+            [](pthread_t) {});
+        CHECK(cancelled);
+        CHECK(openFiles() == before);
+    }
+}
+
+TEST_CASE("a thread that asks for nothing but the name can be cancelled, and leaves no file open") {
+    auto const before = openFiles();
+    for (int i = 0; i < 100; ++i) {
+        bool const cancelled = test::endsCancelled(
+            [] {
+                for (;;) static_cast<void>(Koru::System::getProcessFileName());
+            },
+            [i](pthread_t thread) {
+                for (int turn = 0; turn < i; ++turn) ::sched_yield();
+                ::pthread_cancel(thread);
+            });
+        REQUIRE(cancelled);
+    }
+    CHECK(openFiles() == before);
 }
 
 TEST_CASE("several threads may ask for the name at once") {
