@@ -104,7 +104,14 @@ File::Path::Path(char const* text) : Path(make_wstring(text)) {}
 
 File::Path::Path(Path const& other) = default;
 
-File::Path& File::Path::operator=(Path const& other) = default;
+// All or nothing: what needs memory is done before this path changes.
+File::Path& File::Path::operator=(Path const& other) {
+    Path copy(other);
+    volume_.swap(copy.volume_);
+    directory_.swap(copy.directory_);
+    name_.swap(copy.name_);
+    return *this;
+}
 
 File::Path::~Path() = default;
 

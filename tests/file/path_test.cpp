@@ -9,9 +9,11 @@
 
 #include <chrono>
 #include <cstddef>
+#include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <initializer_list>
+#include <new>
 #include <sstream>
 #include <stdexcept>
 #include <string>
@@ -25,6 +27,23 @@
 #include "support/subprocess.h"
 #include "support/tempdir.h"
 #include "support/throws.h"
+
+// The memory of this executable and the libraries it loaded comes from here, so that a test can let
+// it run out.
+namespace {
+
+thread_local long allocationsBeforeFailure = -1; // -1: none fails
+
+} // namespace
+
+void* operator new(std::size_t size) {
+    bool const fails = allocationsBeforeFailure >= 0 && allocationsBeforeFailure-- == 0;
+    void* const memory = fails ? nullptr : std::malloc(size == 0 ? 1 : size);
+    if (memory == nullptr) throw std::bad_alloc();
+    return memory;
+}
+void operator delete(void* memory) noexcept { std::free(memory); }
+void operator delete(void* memory, std::size_t) noexcept { std::free(memory); }
 
 namespace {
 
@@ -535,6 +554,58 @@ TEST_CASE("a refused text leaves the path it was to be assigned to as it was") {
     CHECK(test::messageOf<std::invalid_argument>([&] { path = L"/x"; }) == UNDETERMINED);
     CHECK(test::messageOf<std::invalid_argument>([&] { path = ""; }) == EMPTY);
     CHECK(std::wstring(path) == L"/a/b");
+}
+
+namespace {
+
+/// Assigns with allocation number `before` (from 0) failing; whether there was memory enough.
+template <class Source>
+bool assign(File::Path& path, Source const& source, long before) {
+    allocationsBeforeFailure = before;
+    try {
+        path = source;
+        allocationsBeforeFailure = -1;
+        return true;
+    } catch (std::bad_alloc const&) {
+        allocationsBeforeFailure = -1;
+        return false;
+    }
+}
+
+/// Lets each allocation of the assignment fail in turn and tells how many there are.
+template <class Source>
+long checkAssignment(Source const& source, File::Path const& expected) {
+    for (long before = 0;; ++before) {
+        CAPTURE(before);
+        File::Path path(L"/a/b");
+        path.setVolume(L"C:");
+        bool const done = assign(path, source, before);
+        bool const isNew = path.getVolume() == expected.getVolume() &&
+                           path.getDirectory() == expected.getDirectory() &&
+                           path.getName() == expected.getName();
+        CHECK(isNew == done);
+        if (done) return before;
+        CHECK(path.getVolume() == L"C:");
+        CHECK(path.getDirectory() == L"/a/");
+        CHECK(path.getName() == L"b");
+    }
+}
+
+} // namespace
+
+TEST_CASE("when memory runs out, a path that is assigned to keeps all of its parts") {
+    std::wstring const text = L"/" + std::wstring(100, L'd') + L"/" + std::wstring(100, L'n');
+    std::string const narrow = Koru::make_string(text);
+    File::Path const path(text);
+    CHECK(checkAssignment(text, path) >= 2);
+    CHECK(checkAssignment(text.c_str(), path) >= 2);
+    CHECK(checkAssignment(narrow, path) >= 2);
+    CHECK(checkAssignment(narrow.c_str(), path) >= 2);
+    File::Path withVolume(text);
+    withVolume.setVolume(std::wstring(100, L'v'));
+    CHECK(checkAssignment(withVolume, withVolume) == 3);
+    std::wstring const relative = std::wstring(100, L'r') + L"/x.ini";
+    CHECK(checkAssignment(relative, File::Path(relative)) >= 2);
 }
 
 TEST_CASE("a path is written to a stream as the low bytes of its characters") {
