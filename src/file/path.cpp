@@ -3,7 +3,10 @@
 #include <stdlib.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <cerrno>
 #include <climits>
+#include <cstring>
 #include <stdexcept>
 #include <string_view>
 
@@ -19,17 +22,25 @@ wchar_t const _COLON = L':';
 
 namespace {
 
-/// The resolved form of a path, or an empty string.
+constexpr int LONGEST_CHAIN = 40; // links, as many as the system follows
+
+/// The resolved form of a path; the path itself where it has none.
 std::string _resolve(std::string const& path) {
     char buffer[PATH_MAX];
-    return ::realpath(path.c_str(), buffer) == nullptr ? std::string() : std::string(buffer);
+    return ::realpath(path.c_str(), buffer) == nullptr ? path : std::string(buffer);
 }
 
-/// The length of the longest part of the path, cut before a slash, that exists. `known` is the
-/// length of a part to begin with, so that each component behind it is looked up once at the most,
-/// and none behind the first that is missing.
-std::size_t _existingLength(std::string const& path, std::size_t known) {
-    std::size_t existing = known;
+/// What a link leads to, as it is written there; an empty string for what is no link.
+std::string _targetOf(std::string const& link) {
+    char buffer[PATH_MAX];
+    ssize_t const size = ::readlink(link.c_str(), buffer, sizeof buffer);
+    return size <= 0 ? std::string() : std::string(buffer, static_cast<std::size_t>(size));
+}
+
+/// The length of the longest part of the path, cut before a slash, that exists. No component is
+/// looked up twice, and none after the first that is missing.
+std::size_t _existingLength(std::string const& path) {
+    std::size_t existing = 0;
     for (;;) {
         std::size_t const slash = path.find('/', existing + 1);
         if (slash == std::string::npos) return existing;
@@ -38,24 +49,48 @@ std::size_t _existingLength(std::string const& path, std::size_t known) {
     }
 }
 
-/// Resolves a path below the executable's directory, of which `prefix` bytes name that directory:
-/// what exists through the system, the rest appended as it is, since most files that a program
-/// writes do not exist yet.
-std::string _resolveBelow(std::string const& path, std::size_t prefix) {
-    std::string whole = _resolve(path);
-    if (!whole.empty()) return whole;
-    std::size_t const existing = _existingLength(path, prefix == 0 ? 0 : prefix - 1);
-    std::string const start = path[0] == '/' ? "/" : ".";
-    std::string const base = _resolve(existing == 0 ? start : path.substr(0, existing));
-    if (base.empty()) return path;
-    return base + '/' + path.substr(existing);
+/// Resolves the part of the path that exists and appends the rest as it is. Where the first
+/// component that is missing is a link, the path goes on with what that leads to, so often at the
+/// most.
+std::string _resolveExisting(std::string path, int links) {
+    for (;; --links) {
+        std::size_t const existing = _existingLength(path);
+        std::size_t const end = std::min(path.find('/', existing + 1), path.size());
+        std::string const base = _resolve(path.substr(0, existing));
+        std::string const target = links == 0 ? std::string() : _targetOf(path.substr(0, end));
+        if (target.empty()) return base + path.substr(existing);
+        path = (target[0] == '/' ? target : base + '/' + target) + path.substr(end);
+    }
+}
+
+/// Resolves an absolute path, of which the end may be missing: most files that a program writes do
+/// not exist yet.
+std::string _resolveMissing(std::string const& path) {
+    char buffer[PATH_MAX] = {};
+    if (::realpath(path.c_str(), buffer) != nullptr) return buffer;
+    // Links that lead back to themselves stay as they are.
+    int const links = errno == ELOOP ? 0 : LONGEST_CHAIN;
+    // The C library leaves in the buffer how far it came before something was missing. Mostly that
+    // is how the path begins, so there is nothing to resolve.
+    std::size_t const size = std::strlen(buffer);
+    bool const isBeginning = size != 0 && path.compare(0, size, buffer) == 0 &&
+                             (path.size() == size || path[size] == '/');
+    return isBeginning ? path : _resolveExisting(path, links);
+}
+
+/// Joins a path without the executable's directory to the working directory.
+std::string _belowWorkingDirectory(std::string const& path) {
+    std::string const directory = _resolve(".");
+    if (directory[0] != '/') throw std::invalid_argument("cannot determine path");
+    return directory + '/' + path;
 }
 
 std::wstring _relativeToExecutable(std::wstring const& text) {
     std::wstring directory = System::getProcessFileName();
     directory.resize(directory.rfind(_FSLASH) + 1); // to nothing when there is no slash
-    std::string const prefix = make_string(directory);
-    return make_wstring(_resolveBelow(prefix + make_string(text), prefix.size()));
+    std::string path = make_string(directory) + make_string(text);
+    if (path[0] != '/') path = _belowWorkingDirectory(path);
+    return make_wstring(_resolveMissing(path));
 }
 
 /// The directory part of a path, which ends behind its last separator, with one forward slash at

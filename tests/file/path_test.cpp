@@ -5,6 +5,7 @@
 #include <koru/system.h>
 
 #include <stdlib.h>
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -102,16 +103,29 @@ void answerWith(std::wstring const& text) {
     }
 }
 
-/// Parses each argument and answers with directory and name; changes the working directory first
-/// for an argument that begins with "CHDIR=".
+/// From now on no file can be opened, so nothing says where the executable is.
+bool refuseFiles() {
+    rlimit const none{0, 0};
+    return ::setrlimit(RLIMIT_NOFILE, &none) == 0;
+}
+
+/// Changes the process as an argument in capitals says. False when that fails.
+bool follow(std::string const& argument) {
+    std::string const operand = argument.substr(argument.find('=') + 1);
+    if (argument.compare(0, 6, "CHDIR=") == 0) return ::chdir(operand.c_str()) == 0;
+    if (argument.compare(0, 6, "RMDIR=") == 0) return ::rmdir(operand.c_str()) == 0;
+    return argument == "WITHOUT_FILES" && refuseFiles();
+}
+
+/// Parses each argument and answers with directory and name, or follows it.
 int parse(int count, char** arguments) {
     for (int i = 0; i < count; ++i) {
         std::string const argument = arguments[i];
-        if (argument.compare(0, 6, "CHDIR=") != 0) {
+        bool const isText = argument.find_first_not_of("0123456789abcdef") == std::string::npos;
+        if (isText)
             answerWith(fromHex(argument));
-        } else if (::chdir(argument.c_str() + 6) != 0) {
+        else if (!follow(argument))
             return 1;
-        }
     }
     return 0;
 }
@@ -135,14 +149,22 @@ int create(int, char** arguments) {
 }
 
 /// The text of a relative path found the naive way: as much of the joined text as can be resolved,
-/// taking off one component at a time, with the rest behind it.
+/// taking off one component at a time, with the rest after it. Of a link that cannot be resolved,
+/// what the C library leaves in its buffer is as much as can be.
 std::string naive(std::string const& directory, std::string const& text) {
     std::string const joined = directory + text;
     std::size_t cut = joined.size();
+    std::size_t missing = cut;
     char resolved[4096] = {};
     while (::realpath(joined.substr(0, cut).c_str(), resolved) == nullptr) {
+        missing = cut;
         cut = joined.rfind('/', cut - 1);
         std::memset(resolved, 0, sizeof resolved);
+    }
+    std::string const prefix = joined.substr(0, missing);
+    if (cut != joined.size() && std::filesystem::is_symlink(prefix)) {
+        static_cast<void>(::realpath(prefix.c_str(), resolved) == nullptr);
+        cut = missing;
     }
     std::string parsed;
     for (char const c : resolved + joined.substr(cut)) {
@@ -729,13 +751,107 @@ TEST_CASE("the missing part of a relative path is appended verbatim") {
                          {L"new/../conf/app.ini", "/bin/new/../conf/", "app.ini"}});
 }
 
-TEST_CASE("a dangling link counts as missing") {
+TEST_CASE("a relative path through a dangling link is the path that the link leads to") {
     Installation const installation;
-    check(installation, {{L"dangling", "/bin/", "dangling"},
-                         {L"dangling/x.ini", "/bin/dangling/", "x.ini"},
-                         {L"link/../bin/dangling/", "/bin/dangling/", ""},
-                         {L"loop", "/bin/", "loop"},
-                         {L"loop/x.ini", "/bin/loop/", "x.ini"}});
+    auto const link = [&](char const* target, char const* name) {
+        std::filesystem::create_symlink(target, installation.dir / name);
+    };
+    link("dangling", "bin/again");
+    link("again", "bin/and-again");
+    link("sub/new.ini", "shared/to-new");
+    link("none/at/all.ini", "bin/far");
+    link("../none//", "bin/slashes");
+    link("conf/../new.ini", "bin/around");
+    link("file.txt/new.ini", "bin/below-file");
+    link((installation.dir / "else/new.ini").c_str(), "bin/absolute");
+    check(installation, {{L"dangling", "/bin/", "nowhere"},
+                         {L"dangling/x.ini", "/bin/nowhere/", "x.ini"},
+                         {L"dangling/../x.ini", "/bin/nowhere/../", "x.ini"},
+                         {L"link/../bin/dangling/", "/bin/nowhere/", ""},
+                         {L"again", "/bin/", "nowhere"},
+                         {L"and-again", "/bin/", "nowhere"},
+                         {L"and-again/sub/x.ini", "/bin/nowhere/sub/", "x.ini"},
+                         {L"link/to-new", "/shared/sub/", "new.ini"},
+                         {L"../shared/to-new", "/shared/sub/", "new.ini"},
+                         {L"far", "/bin/none/at/", "all.ini"},
+                         {L"far/x.ini", "/bin/none/at/all.ini/", "x.ini"},
+                         {L"slashes", "/none/", ""},
+                         {L"slashes/x.ini", "/none/", "x.ini"},
+                         {L"around", "/bin/", "new.ini"},
+                         {L"below-file", "/bin/file.txt/", "new.ini"},
+                         {L"absolute", "/else/", "new.ini"},
+                         {L"absolute/x.ini", "/else/new.ini/", "x.ini"},
+                         {L"dangling/dangling", "/bin/nowhere/", "dangling"}});
+}
+
+TEST_CASE("links that lead back to themselves stay in a relative path") {
+    Installation const installation;
+    std::filesystem::create_symlink("ring2", installation.dir / "bin/ring1");
+    std::filesystem::create_symlink("ring1", installation.dir / "bin/ring2");
+    std::filesystem::create_symlink("loop", installation.dir / "bin/to-loop");
+    std::filesystem::create_symlink("longer/x", installation.dir / "bin/longer");
+    check(installation, {{L"loop", "/bin/", "loop"},
+                         {L"loop/x.ini", "/bin/loop/", "x.ini"},
+                         {L"ring1/x.ini", "/bin/ring1/", "x.ini"},
+                         {L"conf/../ring2/x.ini", "/bin/ring2/", "x.ini"},
+                         {L"conf/../to-loop/x.ini", "/bin/to-loop/", "x.ini"},
+                         {L"longer", "/bin/", "longer"}});
+}
+
+TEST_CASE("a chain of links is followed as far as the system does it") {
+    Installation const installation;
+    for (int i = 1; i <= 50; ++i) {
+        std::string const target = i == 1 ? "nowhere" : "chain" + std::to_string(i - 1);
+        std::filesystem::create_symlink(target,
+                                        installation.dir / ("bin/chain" + std::to_string(i)));
+    }
+    check(installation, {{L"chain1/x.ini", "/bin/nowhere/", "x.ini"},
+                         {L"chain40", "/bin/", "nowhere"},
+                         {L"conf/../chain40/x.ini", "/bin/nowhere/", "x.ini"},
+                         {L"chain50/x.ini", "/bin/chain50/", "x.ini"}});
+}
+
+TEST_CASE("a file is created where a dangling link leads to") {
+    Installation const installation;
+    CHECK(test::ask(installation.program, installation.program, "/", "create", {"dangling"}) ==
+          Strings{installation.dir / "bin/nowhere"});
+    CHECK(test::readFile(installation.dir / "bin/nowhere") == "here");
+    CHECK(std::filesystem::is_symlink(installation.dir / "bin/dangling"));
+}
+
+TEST_CASE("a relative path is refused when neither executable nor working directory can be told") {
+    Installation const installation;
+    std::string const gone = installation.dir / "gone";
+    Strings const refused{"invalid_argument", UNDETERMINED};
+    for (char const* argv0 : {"", "prog", "./prog", "../bin/prog"}) {
+        for (wchar_t const* text :
+             {L"x.ini", L"conf/app.ini", L"../bin/conf/app.ini", L".", L"\\"}) {
+            std::filesystem::create_directory(gone);
+            std::string const narrow = Koru::make_string(text);
+            CAPTURE(argv0);
+            CAPTURE(narrow);
+            CHECK(test::ask(installation.program, argv0, gone, "parse",
+                            {"RMDIR=" + gone, toHex(text)}) == refused);
+            std::filesystem::create_directory(gone);
+            CHECK(test::ask(installation.program, argv0, gone, "parse",
+                            {"RMDIR=" + gone, "WITHOUT_FILES", toHex(text)}) == refused);
+        }
+    }
+}
+
+TEST_CASE("one of executable and working directory is enough for a relative path") {
+    Installation const installation;
+    std::string const gone = installation.dir / "gone";
+    std::filesystem::create_directory(gone);
+    CHECK(test::ask(installation.program, installation.program, gone, "parse",
+                    {"RMDIR=" + gone, toHex(L"conf/app.ini"), toHex(L"new.ini"),
+                     toHex(L"/a/b.ini")}) == Strings{installation.dir / "bin/conf/", "app.ini",
+                                                     installation.dir / "bin/", "new.ini", "/a/",
+                                                     "b.ini"});
+    CHECK(test::ask(installation.program, installation.program, installation.dir / "elsewhere",
+                    "parse", {"WITHOUT_FILES", toHex(L"conf/app.ini"), toHex(L"new/x.ini")}) ==
+          Strings{installation.dir / "elsewhere/conf/", "app.ini",
+                  installation.dir / "elsewhere/new/", "x.ini"});
 }
 
 TEST_CASE("what lies below a file counts as missing") {
@@ -848,7 +964,7 @@ TEST_CASE("any number of components may be missing") {
     CHECK((parsed("", 20000) == expected("bin/", 20000)));
     CHECK((parsed("link/", 20000) == expected("shared/", 20000)));
     CHECK((parsed("filelink/", 20000) == expected("shared/data.txt/", 20000)));
-    CHECK((parsed("conf/../dangling/", 20000) == expected("bin/dangling/", 20000)));
+    CHECK((parsed("conf/../dangling/", 20000) == expected("bin/nowhere/", 20000)));
 
     // About a second's work; if each component cost a look at all of them, it would be hours.
     auto const begin = std::chrono::steady_clock::now();
