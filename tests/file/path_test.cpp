@@ -395,6 +395,50 @@ TEST_CASE("an absolute path is split at its last slash, slashes made one, nothin
     }
 }
 
+namespace {
+
+/// Every text of up to so many characters out of some.
+std::vector<std::wstring> texts(std::wstring const& characters, std::size_t longest) {
+    std::vector<std::wstring> all{L""};
+    for (std::size_t i = 0; i < all.size() && all[i].size() < longest; ++i) {
+        for (wchar_t const c : characters) all.push_back(all[i] + c);
+    }
+    return all;
+}
+
+/// Directory and name of an absolute path by the plain rule: every segment before a separator that
+/// is not empty, and what comes after the last separator.
+struct Split {
+    explicit Split(std::wstring const& text) {
+        for (wchar_t const c : text) {
+            name += c;
+            if (c != L'/' && c != L'\\') continue;
+            name.pop_back();
+            if (!name.empty()) directory += name + L"/";
+            name.clear();
+        }
+    }
+    std::wstring directory = L"/";
+    std::wstring name;
+};
+
+} // namespace
+
+TEST_CASE("every short absolute path is split as the plain rule says") {
+    for (std::wstring const& text : texts(L"/\\a.", 6)) {
+        std::string const narrow = "/" + Koru::make_string(text);
+        CAPTURE(narrow);
+        Split const split(L"/" + text);
+        if (split.directory == L"/") {
+            CHECK(complaintAbout(L"/" + text) == UNDETERMINED);
+            continue;
+        }
+        File::Path const path(L"/" + text);
+        CHECK(path.getDirectory() == split.directory);
+        CHECK(path.getName() == split.name);
+    }
+}
+
 TEST_CASE("a path without a directory below the root cannot be represented") {
     for (std::wstring const& text :
          {std::wstring(L"/x.txt"), std::wstring(L"/"), std::wstring(L"//"), std::wstring(L"///x"),
@@ -498,6 +542,19 @@ TEST_CASE("a setter changes its part only") {
     CHECK(std::wstring(path) == L"C:/c/d");
     CHECK(path.getName() == L"/c/d");
 }
+
+#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
+TEST_CASE("a path too long for a wide string is std::bad_alloc") {
+    // Where it would need more memory than there is, nothing can be told.
+    if (sizeof(std::size_t) > 4) return;
+    std::size_t const half = std::wstring().max_size() / 2 + 1;
+    File::Path path;
+    path.setDirectory(std::wstring(half, L'd'));
+    path.setName(path.getDirectory());
+    CHECK(test::messageOf<std::bad_alloc>([&] { static_cast<void>(std::wstring(path)); }) ==
+          std::bad_alloc().what());
+}
+#endif
 
 TEST_CASE("setters never add a separator") {
     File::Path path;
@@ -690,6 +747,40 @@ TEST_CASE("paths are equal when their texts are, without regard to case") {
     CHECK((File::Path(L"/a/b") == L"/A/B"));
     CHECK(("/A/B" == File::Path(L"/a/b")));
     CHECK((File::Path(L"/a/b") != std::string("/a/c")));
+}
+
+TEST_CASE("paths of any parts are equal when compare finds their texts equal") {
+    std::vector<File::Path> paths;
+    std::vector<std::wstring> const parts = texts(std::wstring(L"aA\0", 3), 1);
+    for (std::wstring const& volume : parts) {
+        for (std::wstring const& directory : texts(std::wstring(L"aB\0", 3), 2)) {
+            for (std::wstring const& name : parts) {
+                paths.emplace_back();
+                paths.back().setVolume(volume);
+                paths.back().setDirectory(directory);
+                paths.back().setName(name);
+            }
+        }
+    }
+    std::size_t wrong = 0;
+    for (File::Path const& a : paths) {
+        for (File::Path const& b : paths) {
+            bool const equal = Koru::compare(std::wstring(a), std::wstring(b)) == 0;
+            if ((a == b) != equal || (a != b) == equal) ++wrong;
+        }
+    }
+    CHECK(wrong == 0);
+}
+
+TEST_CASE("equality takes the parts that a path converts to, not what overrides give") {
+    struct Renamed : File::Path {
+        using File::Path::Path;
+        std::wstring const& getName() const override { return other; }
+        std::wstring other = L"other";
+    };
+    Renamed const renamed(L"/a/b");
+    CHECK((renamed == File::Path(L"/a/b")));
+    CHECK((renamed != File::Path(L"/a/other")));
 }
 
 TEST_CASE("a relative path is joined to the executable's directory and resolved") {
