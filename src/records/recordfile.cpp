@@ -25,9 +25,9 @@ public:
     bool atEnd() { return at_ == filled_ && !fill(); }
 
     void readInto(RecordSet& records) {
-        readPart(keyBytes_);
+        readBytes(keyBytes_);
         decodeKey();
-        readPart(data_);
+        readBytes(data_);
         records.add(key_, data_);
     }
 
@@ -74,29 +74,28 @@ private:
 
     /// Reads a length and as many bytes. A length is only believed as far as bytes arrive: memory
     /// grows with them, to twice as much at the most.
-    template <class Bytes>
-    void readPart(Bytes& part) {
+    template <class Byte>
+    void readBytes(std::vector<Byte>& bytes) {
         constexpr std::size_t firstStep = 64 * 1024;
         std::size_t const length = readLength();
-        if (length > part.max_size()) throw std::bad_alloc();
-        part.clear();
-        while (part.size() < length) {
-            std::size_t const arrived = part.size();
-            part.resize(arrived + std::min(length - arrived, std::max(arrived, firstStep)));
-            read(reinterpret_cast<char*>(&part[arrived]), part.size() - arrived);
+        if (length > bytes.max_size()) throw std::bad_alloc();
+        bytes.clear();
+        while (bytes.size() < length) {
+            std::size_t const arrived = bytes.size();
+            bytes.resize(arrived + std::min(length - arrived, std::max(arrived, firstStep)));
+            read(reinterpret_cast<char*>(&bytes[arrived]), bytes.size() - arrived);
         }
     }
 
     /// The second byte of each pair, sign-extended. Intended: also where that is a character beyond
-    /// 0x7FFFFFFF. Behind an odd length a zero is read.
+    /// 0x7FFFFFFF; and after an odd length a zero is read.
     void decodeKey() {
-        std::size_t const characters = keyBytes_.size() / 2 + keyBytes_.size() % 2;
+        std::size_t const pairs = keyBytes_.size() / 2;
+        std::size_t const characters = pairs + keyBytes_.size() % 2;
         if (characters > key_.max_size()) throw std::bad_alloc();
-        key_.resize(characters);
-        char const* low = keyBytes_.data() + 1; // a string has a zero behind its end
-        for (wchar_t& c : key_) {
-            c = static_cast<signed char>(*low);
-            low += 2;
+        key_.assign(characters, L'\0');
+        for (std::size_t i = 0; i < pairs; ++i) {
+            key_[i] = static_cast<signed char>(keyBytes_[2 * i + 1]);
         }
     }
 
@@ -104,7 +103,7 @@ private:
     std::unique_ptr<char[]> block_;
     std::size_t at_ = 0;
     std::size_t filled_ = 0;
-    std::string keyBytes_;
+    std::vector<char> keyBytes_;
     std::wstring key_;
     std::vector<unsigned char> data_;
 };
