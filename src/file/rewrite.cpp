@@ -14,16 +14,26 @@ namespace Koru {
 
 namespace {
 
-/// Writes a block and tells whether all of it was taken.
-bool _write(int descriptor, std::string_view block) {
-    while (!block.empty()) {
-        ssize_t const n = ::write(descriptor, block.data(), block.size());
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) return false;
-        block.remove_prefix(static_cast<std::size_t>(n));
+/// A descriptor. Where it refuses a block, the content ends.
+class DescriptorSink : public Sink {
+public:
+    explicit DescriptorSink(int descriptor) : descriptor_(descriptor) {}
+
+    void write(std::string_view block) override {
+        while (!refused_ && !block.empty()) {
+            ssize_t const n = ::write(descriptor_, block.data(), block.size());
+            if (n < 0 && errno == EINTR) continue;
+            if (n <= 0)
+                refused_ = true;
+            else
+                block.remove_prefix(static_cast<std::size_t>(n));
+        }
     }
-    return true;
-}
+
+private:
+    int descriptor_;
+    bool refused_ = false;
+};
 
 /// Creates the file, or empties it.
 int _create(std::string const& name) {
@@ -34,12 +44,11 @@ int _create(std::string const& name) {
 }
 
 /// Writes the content without a stream, as far as the system takes it.
-void _save(std::string const& name, Content& content) {
+void _save(std::string const& name, Content const& content) {
     int const descriptor = _create(name);
     if (descriptor < 0) return;
-    for (std::string_view block = content.next(); !block.empty(); block = content.next()) {
-        if (!_write(descriptor, block)) break;
-    }
+    DescriptorSink sink(descriptor);
+    content.writeTo(sink);
     ::close(descriptor);
 }
 
@@ -47,14 +56,26 @@ void _check(File const& file) {
     if (file.fail()) throw std::runtime_error("failed to write to file");
 }
 
-void _write(File& file, Content& content) {
+/// A stream. Where it refuses a block, that is thrown.
+class StreamSink : public Sink {
+public:
+    explicit StreamSink(File& file) : file_(file) {}
+
+    void write(std::string_view block) override {
+        // Unformatted: `<<` would find the inserter that counts with 8 bits.
+        file_.write(block.data(), static_cast<std::streamsize>(block.size()));
+        _check(file_);
+    }
+
+private:
+    File& file_;
+};
+
+void _write(File& file, Content const& content) {
     file.flush();
     file.clear();
-    // Unformatted: `<<` would find the inserter that counts with 8 bits.
-    for (std::string_view block = content.next(); !block.empty(); block = content.next()) {
-        file.write(block.data(), static_cast<std::streamsize>(block.size()));
-        _check(file);
-    }
+    StreamSink sink(file);
+    content.writeTo(sink);
     // What stays in the stream's buffer has not met a full disk yet.
     file.flush();
     _check(file);
@@ -62,7 +83,7 @@ void _write(File& file, Content& content) {
 
 } // namespace
 
-void rewrite(File& file, Content& content) {
+void rewrite(File& file, Content const& content) {
     unsigned long const mode = file.getMode();
     std::wstring const wideName = file.getName();
     std::string const name = make_string(wideName);

@@ -11,14 +11,21 @@
 
 namespace Koru {
 
-/// The new content of a file, given block by block. All memory that giving it takes is there before
-/// the old file is touched.
+/// What takes the new content of a file.
+class Sink {
+public:
+    virtual ~Sink() = default;
+    virtual void write(std::string_view block) = 0;
+};
+
+/// The new content of a file. All memory that writing it takes is there before the old file is
+/// touched.
 class Content {
 public:
     virtual ~Content() = default;
 
-    /// The next block, valid until the next call; empty at the end.
-    virtual std::string_view next() = 0;
+    /// Writes all of it, block by block and in order, as often as it is asked for.
+    virtual void writeTo(Sink& sink) const = 0;
 };
 
 /// Opens the file, discards what was held in memory and loads the file if the mode says so. A
@@ -38,7 +45,7 @@ void openAndLoad(File& file, unsigned long mode, Discard discard, Load load) {
 
 /// Deletes the file and writes it anew with the mode of now; it is open afterwards.
 /// @throws std::runtime_error "failed to write to file", and what File::open and close throw
-void rewrite(File& file, Content& content);
+void rewrite(File& file, Content const& content);
 
 /// Writes the file anew if the mode says so, then discards what was held in memory and closes.
 /// `prepare` gives the content, ready to be written, before the old file is touched: what fails for
@@ -49,7 +56,7 @@ void writeBackAndClose(File& file, Prepare prepare, Discard discard) {
     FileGuard const guard(file);
     CancellationOff const cancellationOff;
     if ((file.getMode() & File::WRITE) != 0) {
-        auto content = prepare();
+        auto const content = prepare();
         rewrite(file, content);
     }
     discard();

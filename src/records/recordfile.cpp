@@ -1,11 +1,15 @@
 #include "records/recordfile.h"
 
 #include <algorithm>
+#include <array>
+#include <cstddef>
+#include <cstdint>
 #include <cstring>
 #include <limits>
 #include <new>
 #include <stdexcept>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "file/rewind.h"
@@ -14,6 +18,7 @@ namespace Koru {
 
 namespace {
 
+constexpr std::size_t BLOCK = 64 * 1024; // bytes
 constexpr std::size_t LENGTH_SIZE = 4;
 constexpr std::uint64_t LONGEST = std::numeric_limits<std::uint32_t>::max();
 
@@ -32,8 +37,6 @@ public:
     }
 
 private:
-    static constexpr std::size_t BLOCK = 64 * 1024;
-
     [[noreturn]] void fail() {
         file_.setstate(std::ios::failbit);
         throw std::runtime_error("failed to read from file");
@@ -108,6 +111,66 @@ private:
     std::vector<unsigned char> data_;
 };
 
+/// Writes one record after the other into a block, which a sink gets whenever it is full.
+class Writer {
+public:
+    Writer(char* block, Sink& sink) : block_(block), sink_(sink) {}
+
+    void write(DataFile::Record const& record) {
+        std::wstring const& key = record.getKey();
+        std::vector<unsigned char> const& data = record.getData();
+        writeLength(2 * key.size());
+        writeKey(key.data(), key.size());
+        writeLength(data.size());
+        writeData(data.data(), data.size());
+    }
+
+    /// Gives what is in the block to the sink.
+    void flush() {
+        sink_.write(std::string_view(block_, filled_));
+        filled_ = 0;
+    }
+
+private:
+    /// The bytes that the block still takes; so many at least.
+    std::size_t room(std::size_t least) {
+        if (BLOCK - filled_ < least) flush();
+        return BLOCK - filled_;
+    }
+
+    void writeLength(std::size_t length) {
+        room(LENGTH_SIZE);
+        for (std::size_t i = 0; i < LENGTH_SIZE; ++i) {
+            block_[filled_++] = static_cast<char>((length >> (8 * i)) & 0xFF);
+        }
+    }
+
+    void writeKey(wchar_t const* key, std::size_t size) {
+        while (size != 0) {
+            std::size_t const step = std::min(size, room(2) / 2);
+            for (wchar_t const* const end = key + step; key != end; ++key) {
+                block_[filled_++] = '\0';
+                block_[filled_++] = static_cast<char>(*key);
+            }
+            size -= step;
+        }
+    }
+
+    void writeData(unsigned char const* data, std::size_t size) {
+        while (size != 0) {
+            std::size_t const step = std::min(size, room(1));
+            std::memcpy(block_ + filled_, data, step);
+            filled_ += step;
+            data += step;
+            size -= step;
+        }
+    }
+
+    char* block_;
+    Sink& sink_;
+    std::size_t filled_ = 0;
+};
+
 } // namespace
 
 void readRecords(File& file, RecordSet& records) {
@@ -125,58 +188,10 @@ RecordContent::RecordContent(RecordSet const& records)
     }
 }
 
-std::string_view RecordContent::next() {
-    filled_ = 0;
-    while (position_ < records_.size() && put(records_[position_])) ++position_;
-    return std::string_view(block_.get(), filled_);
-}
-
-/// Puts what is still to come of a record into the block and tells whether that was all.
-bool RecordContent::put(DataFile::Record const& record) {
-    std::wstring const& key = record.getKey();
-    std::vector<unsigned char> const& data = record.getData();
-    if (stage_ == Stage::KEY_LENGTH && !putLength(2 * key.size(), Stage::KEY)) return false;
-    if (stage_ == Stage::KEY && !putKey(key)) return false;
-    if (stage_ == Stage::DATA_LENGTH && !putLength(data.size(), Stage::DATA)) return false;
-    return putData(data);
-}
-
-bool RecordContent::putLength(std::size_t length, Stage next) {
-    if (BLOCK - filled_ < LENGTH_SIZE) return false;
-    for (std::size_t i = 0; i < LENGTH_SIZE; ++i) {
-        block_[filled_++] = static_cast<char>((length >> (8 * i)) & 0xFF);
-    }
-    goTo(next);
-    return true;
-}
-
-bool RecordContent::putKey(std::wstring const& key) {
-    std::size_t const count = std::min(key.size() - done_, (BLOCK - filled_) / 2);
-    char* to = block_.get() + filled_;
-    for (wchar_t const* c = key.data() + done_; c != key.data() + done_ + count; ++c) {
-        *to++ = '\0';
-        *to++ = static_cast<char>(*c);
-    }
-    filled_ += 2 * count;
-    done_ += count;
-    if (done_ < key.size()) return false;
-    goTo(Stage::DATA_LENGTH);
-    return true;
-}
-
-bool RecordContent::putData(std::vector<unsigned char> const& data) {
-    std::size_t const size = std::min(data.size() - done_, BLOCK - filled_);
-    if (size != 0) std::memcpy(block_.get() + filled_, data.data() + done_, size);
-    filled_ += size;
-    done_ += size;
-    if (done_ < data.size()) return false;
-    goTo(Stage::KEY_LENGTH);
-    return true;
-}
-
-void RecordContent::goTo(Stage stage) {
-    stage_ = stage;
-    done_ = 0;
+void RecordContent::writeTo(Sink& sink) const {
+    Writer writer(block_.get(), sink);
+    for (std::size_t i = 0; i < records_.size(); ++i) writer.write(records_[i]);
+    writer.flush();
 }
 
 } // namespace Koru

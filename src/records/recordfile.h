@@ -5,18 +5,13 @@
 //     D       4 bytes, little-endian: length of the data in bytes
 //     data    D bytes
 //
-// for one record after the other; docs/formats.md draws it. Nothing stands before, between or
-// behind them.
+// for one record after the other; docs/formats.md draws it. There is nothing else in the file.
 #ifndef KORU_RECORDS_RECORDFILE_H
 #define KORU_RECORDS_RECORDFILE_H
 
 #include <koru/datafile.h>
 
-#include <array>
-#include <cstddef>
-#include <cstdint>
 #include <memory>
-#include <string_view>
 
 #include "file/rewrite.h"
 #include "records/recordset.h"
@@ -34,24 +29,10 @@ public:
     /// @throws std::runtime_error "failed to write to file" when a length does not fit its field
     explicit RecordContent(RecordSet const& records);
 
-    std::string_view next() override;
+    void writeTo(Sink& sink) const override;
 
 private:
-    enum class Stage { KEY_LENGTH, KEY, DATA_LENGTH, DATA };
-
-    bool put(DataFile::Record const& record);
-    bool putLength(std::size_t length, Stage next);
-    bool putKey(std::wstring const& key);
-    bool putData(std::vector<unsigned char> const& data);
-    void goTo(Stage stage);
-
-    static constexpr std::size_t BLOCK = 64 * 1024;
-
     RecordSet const& records_;
-    std::size_t position_ = 0;
-    Stage stage_ = Stage::KEY_LENGTH;
-    std::size_t done_ = 0; // of the key or the data
-    std::size_t filled_ = 0;
     std::unique_ptr<char[]> block_;
 };
 

@@ -22,15 +22,13 @@ enum class Headers {
 class RenderedText : public Content {
 public:
     RenderedText(std::unique_ptr<char[]> bytes, std::size_t size)
-        : bytes_(std::move(bytes)), left_(size) {}
+        : bytes_(std::move(bytes)), size_(size) {}
 
-    std::string_view next() override {
-        return std::string_view(bytes_.get(), std::exchange(left_, 0));
-    }
+    void writeTo(Sink& sink) const override { sink.write(std::string_view(bytes_.get(), size_)); }
 
 private:
     std::unique_ptr<char[]> bytes_;
-    std::size_t left_;
+    std::size_t size_;
 };
 
 RenderedText render(SettingsTable const& table, Headers headers);
