@@ -2,6 +2,11 @@
 
 #include <sys/time.h>
 
+#include <charconv>
+#include <cmath>
+#include <cstring>
+#include <iterator>
+#include <locale>
 #include <ostream>
 
 namespace Koru {
@@ -14,6 +19,27 @@ float _total(Timer const& timer) {
     double const exact = timer.getSeconds() + timer.getMilliseconds() / double{1000.0F};
     float volatile const rounded = static_cast<float>(exact);
     return rounded;
+}
+
+/// Whether a number that is written to the stream has no sign, no padding and no separators.
+bool _writesPlainly(std::ostream const& os) {
+    return os.width() == 0 && (os.flags() & std::ios::showpos) == 0 &&
+           os.getloc() == std::locale::classic();
+}
+
+/// Writes seconds as the stream does that has just been told how. Whole numbers, as those of our
+/// time all are, need none of what the C library does for fractions.
+void _write(std::ostream& os, float seconds) {
+    char text[sizeof "4294967295.000"];
+    bool const isWhole = !std::signbit(seconds) && seconds < 4e9F && seconds == std::trunc(seconds);
+    if (isWhole && _writesPlainly(os)) {
+        char* const point =
+            std::to_chars(text, std::end(text), static_cast<std::uint32_t>(seconds)).ptr;
+        std::strcpy(point, ".000");
+        os << text;
+    } else {
+        os << static_cast<double>(seconds);
+    }
 }
 
 } // namespace
@@ -37,7 +63,8 @@ std::ostream& operator<<(std::ostream& os, Timer const& timer) {
     os.setf(std::ios::fixed, std::ios::floatfield);
     os.setf(std::ios::showpoint);
     os.precision(3);
-    return os << static_cast<double>(elapsed);
+    _write(os, elapsed);
+    return os;
 }
 
 } // namespace Koru

@@ -16,6 +16,7 @@
 #include <locale>
 #include <random>
 #include <sstream>
+#include <stdexcept>
 #include <streambuf>
 #include <string>
 #include <type_traits>
@@ -498,6 +499,110 @@ TEST_CASE("the number is written as the stream writes numbers: width, fill, sign
     continental.imbue(std::locale(std::locale::classic(), new Continental));
     continental << timer;
     CHECK(continental.str() == "2.560,000");
+}
+
+namespace {
+
+/// Takes so many characters, then refuses or throws.
+class Sink : public std::streambuf {
+public:
+    Sink(std::size_t room, bool throws) : room_(room), throws_(throws) {}
+
+    std::string taken;
+    int syncs = 0;
+
+protected:
+    std::streamsize xsputn(char const* s, std::streamsize size) override {
+        std::size_t const fits = std::min(static_cast<std::size_t>(size), room_ - taken.size());
+        taken.append(s, fits);
+        if (fits < static_cast<std::size_t>(size) && throws_) throw std::range_error("full");
+        return static_cast<std::streamsize>(fits);
+    }
+    int overflow(int c) override {
+        char const character = static_cast<char>(c);
+        return xsputn(&character, 1) == 1 ? c : EOF;
+    }
+    int sync() override {
+        ++syncs;
+        return 0;
+    }
+
+private:
+    std::size_t room_;
+    bool throws_;
+};
+
+/// How a stream is set up before a number is written to it.
+struct Setup {
+    std::size_t room;
+    bool throws;
+    std::ios::iostate exceptions;
+    std::ios::fmtflags flags;
+    int width;
+    bool isContinental;
+};
+
+/// All that an insertion leaves behind.
+template <class Insert>
+std::string traceOf(Setup const& setup, Insert insert) {
+    Sink sink(setup.room, setup.throws);
+    Sink tied(0, false);
+    std::ostream other(&tied);
+    std::ostream out(&sink);
+    out.exceptions(setup.exceptions);
+    out.setf(setup.flags);
+    out.width(setup.width);
+    out.fill('*');
+    out.tie(&other);
+    if (setup.isContinental) out.imbue(std::locale(std::locale::classic(), new Continental));
+    std::string thrown = "-";
+    try {
+        insert(out);
+    } catch (std::exception const& e) {
+        thrown = e.what();
+    }
+    std::ostringstream trace;
+    trace << sink.taken << '|' << out.rdstate() << '|' << out.flags() << '|' << out.precision()
+          << '|' << out.width() << '|' << sink.syncs << '|' << tied.syncs << '|' << thrown;
+    return trace.str();
+}
+
+} // namespace
+
+TEST_CASE("writing a timer does to any stream what writing the number does") {
+    std::ios::fmtflags const flagses[] = {{},
+                                          std::ios::showpos,
+                                          std::ios::left,
+                                          std::ios::internal | std::ios::showpos,
+                                          std::ios::unitbuf,
+                                          std::ios::hex | std::ios::showbase | std::ios::uppercase,
+                                          std::ios::scientific | std::ios::showpoint};
+    std::ios::iostate const exceptionses[] = {{}, std::ios::badbit, std::ios::failbit};
+    std::pair<Moment, double> const ends[] = {
+        {{1000, 0}, 0}, {{1001, 0}, 1}, {{3560, 0}, 2560}, {{999, 0}, -1}, {{1000, 500}, 0.5}};
+    for (std::size_t room = 0; room < 14; ++room) {
+        for (int bits = 0; bits < 4; ++bits) {
+            for (std::ios::iostate const exceptions : exceptionses) {
+                for (std::ios::fmtflags const flags : flagses) {
+                    for (int const width : {0, 3, 12}) {
+                        Setup const setup{room, bits % 2 != 0, exceptions, flags, width, bits > 1};
+                        for (auto const& end : ends) {
+                            SetClock clock(1000, 0);
+                            Koru::Timer const timer;
+                            clock.to(end.first.first, static_cast<int>(end.first.second) * 1000);
+                            std::string const ours =
+                                traceOf(setup, [&](std::ostream& out) { out << timer; });
+                            std::string const plain = traceOf(setup, [&](std::ostream& out) {
+                                out << std::fixed << std::showpoint << std::setprecision(3)
+                                    << end.second;
+                            });
+                            if (ours != plain) CHECK(ours == plain);
+                        }
+                    }
+                }
+            }
+        }
+    }
 }
 
 TEST_CASE("the locale set globally plays no part") {
