@@ -18,11 +18,10 @@ public:
     /// Not loaded, with an empty name.
     DynamicLibrary();
 
-    /// Not loaded.
-    /// @param fileName  given to the loader as UTF-8 and otherwise unchanged: a name without a
-    /// slash
-    ///                  is searched for as the loader does, a relative path counts from the working
-    ///                  directory
+    /// Not loaded. The name is given to the loader as UTF-8 and otherwise unchanged: one without a
+    /// slash is searched for as the loader does, a relative path counts from the working directory.
+    /// The loader searches for libkoru's sake: the program's DT_RUNPATH is not used (DT_RPATH and
+    /// LD_LIBRARY_PATH are), and $ORIGIN is the folder of libkoru.
     DynamicLibrary(std::wstring const& fileName);
 
     /// Copies the name and, if the other is loaded, loads the library again under a handle of its

@@ -4,7 +4,8 @@
 ///
 /// Everywhere in the library a string ends at its first NUL character, whatever its stored size.
 /// All functions may be called from any thread at once. None reports an error: text that cannot be
-/// converted comes out as described, and only `std::bad_alloc` can escape.
+/// converted comes out as described. Only `std::bad_alloc` can escape, also for text that is too
+/// long for a string; the inserters fail and throw as the stream's own output does.
 #ifndef KORU_STRING_H
 #define KORU_STRING_H
 
