@@ -181,16 +181,18 @@ void readRecords(File& file, RecordSet& records) {
 
 RecordContent::RecordContent(RecordSet const& records)
     : records_(records), block_(new char[BLOCK]) {
-    for (std::size_t i = 0; i < records.size(); ++i) {
-        bool const fits = std::uint64_t{records[i].getKey().size()} <= LONGEST / 2 &&
-                          std::uint64_t{records[i].getData().size()} <= LONGEST;
+    RecordSet::Cursor cursor(records);
+    while (DataFile::Record const* const record = cursor.next()) {
+        bool const fits = std::uint64_t{record->getKey().size()} <= LONGEST / 2 &&
+                          std::uint64_t{record->getData().size()} <= LONGEST;
         if (!fits) throw std::runtime_error("failed to write to file");
     }
 }
 
 void RecordContent::writeTo(Sink& sink) const {
     Writer writer(block_.get(), sink);
-    for (std::size_t i = 0; i < records_.size(); ++i) writer.write(records_[i]);
+    RecordSet::Cursor cursor(records_);
+    while (DataFile::Record const* const record = cursor.next()) writer.write(*record);
     writer.flush();
 }
 

@@ -71,12 +71,14 @@ public:
             ++used_;
         else
             spare_.pop_back();
-        auto const place =
-            records_.empty() || std::less<>()(records_.back(), copy)
-                ? records_.end()
-                : std::lower_bound(records_.begin(), records_.end(), copy, std::less<>());
-        numbers_.insert(numbers_.begin() + (place - records_.begin()),
-                        _fingerprint(copy->getKey()));
+        Fingerprint const number = _fingerprint(copy->getKey());
+        if (records_.empty() || std::less<>()(records_.back(), copy)) {
+            numbers_.push_back(number);
+            records_.push_back(copy);
+            return;
+        }
+        auto const place = std::lower_bound(records_.begin(), records_.end(), copy, std::less<>());
+        numbers_.insert(numbers_.begin() + (place - records_.begin()), number);
         records_.insert(place, copy);
     }
 
@@ -112,11 +114,6 @@ RecordSet::Place RecordSet::at(std::size_t position) const {
     return Place{block->get(), left};
 }
 
-RecordSet::Record const& RecordSet::operator[](std::size_t position) const {
-    Place const place = at(position);
-    return (*place.block)[place.index];
-}
-
 RecordSet::Record& RecordSet::handOut(std::size_t position) {
     Place const place = at(position);
     place.block->markHandedOut(place.index);
@@ -132,7 +129,23 @@ RecordSet::Place RecordSet::find(std::wstring const& key) const {
     return Place{nullptr, 0};
 }
 
+RecordSet::Record const* RecordSet::Cursor::next() {
+    while (block_ < set_.blocks_.size()) {
+        Block const& block = *set_.blocks_[block_];
+        if (index_ < block.size()) return &block[index_++];
+        ++block_;
+        index_ = 0;
+    }
+    return nullptr;
+}
+
 RecordSet::Block& RecordSet::blockWithRoom() {
+    // Mostly there is room where the last record went.
+    if (last_ == nullptr || !last_->hasRoom()) last_ = &firstWithRoom();
+    return *last_;
+}
+
+RecordSet::Block& RecordSet::firstWithRoom() {
     std::size_t capacity = 0;
     for (std::unique_ptr<Block> const& block : blocks_) {
         if (block->hasRoom()) return *block;
@@ -168,6 +181,7 @@ void RecordSet::remove(std::wstring const& key) {
 
 void RecordSet::clear() {
     blocks_.clear();
+    last_ = nullptr;
     size_ = 0;
 }
 

@@ -30,10 +30,8 @@ public:
 
     std::size_t size() const { return size_; }
 
-    /// The record at a position below the size.
-    Record const& operator[](std::size_t position) const;
-
-    /// The same for a caller who may change the key at any time from now on.
+    /// The record at a position below the size, for a caller who may change its key at any time
+    /// from now on.
     Record& handOut(std::size_t position);
 
     /// Whether a record with an equal key is held.
@@ -49,6 +47,8 @@ public:
     /// Destroys all records.
     void clear();
 
+    class Cursor;
+
 private:
     class Block;
     struct Place {
@@ -59,9 +59,23 @@ private:
     Place at(std::size_t position) const;
     Place find(std::wstring const& key) const;
     Block& blockWithRoom();
+    Block& firstWithRoom();
 
     std::vector<std::unique_ptr<Block>> blocks_; // in the order of their addresses
+    Block* last_ = nullptr;                      // the one that got the last record
     std::size_t size_ = 0;
+};
+
+/// Gives one record after the other, of a set that does not change meanwhile, and then null.
+class RecordSet::Cursor {
+public:
+    explicit Cursor(RecordSet const& set) : set_(set) {}
+    Record const* next();
+
+private:
+    RecordSet const& set_;
+    std::size_t block_ = 0;
+    std::size_t index_ = 0;
 };
 
 } // namespace Koru
