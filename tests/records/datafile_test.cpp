@@ -30,6 +30,7 @@
 #include <functional>
 #include <memory>
 #include <new>
+#include <random>
 #include <set>
 #include <stdexcept>
 #include <string>
@@ -615,6 +616,43 @@ TEST_CASE("every size of key and data around the sizes of buffers is written and
             file.open(READ);
             checkSameRecords(held(file), entries);
         }
+    }
+}
+
+TEST_CASE("keys of every length and any characters are written and read as the plain rule says") {
+    RecordPlace const place;
+    std::mt19937 random(19);
+    for (std::size_t length = 1; length <= 70; ++length) {
+        CAPTURE(length);
+        Entries entries;
+        std::string content;
+        for (int i = 0; i < 20; ++i) {
+            std::wstring key;
+            while (key.size() < length) key += static_cast<wchar_t>(random() >> random() % 32);
+            key.front() = static_cast<wchar_t>(L'a' + i); // none is equal or refused
+            key.back() = L'z';
+            entries.push_back({key, bytes("data")});
+            std::string const field = fileBytes(entries.back());
+            content += field;
+            // What is read may have anything before each character, and half a character more.
+            for (std::size_t at = 4; at < 4 + 2 * length; at += 2) {
+                content[content.size() - field.size() + at] = static_cast<char>(random());
+            }
+        }
+        content += lengthField(static_cast<std::uint32_t>(2 * length + 1)) +
+                   std::string(2 * length + 1, '\xF1') + lengthField(0);
+
+        DataFile file(place.path());
+        file.open(WRITE);
+        for (Entry const& e : entries) file.insert(Record(e.key, e.data));
+        Entries const inserted = held(file);
+        file.close();
+        CHECK(inserted.size() == (length == 1 ? 1U : 20U));
+        bool const same = place.content() == fileBytes(inserted);
+        CHECK(same);
+        test::Loaded const expected = test::load(content);
+        CHECK(expected.entries.size() == 21);
+        checkSameRecords(loaded(place, content), expected.entries);
     }
 }
 
