@@ -30,7 +30,8 @@ class RecordSet;
 ///
 /// Every operation but construction and destruction holds the file's lock from its beginning to its
 /// end, so one object may be used by several threads at once, save for the references that
-/// `operator[]` gives. All operations may throw `std::bad_alloc`.
+/// `operator[]` gives. All operations may throw `std::bad_alloc`. A thread that is cancelled in
+/// `open` leaves the mode 0: nothing is written.
 class KORU_EXPORT DataFile : public File {
 public:
     class Record;
@@ -52,20 +53,24 @@ public:
     /// records: with `READ` by those of the file, otherwise by none. Entries with equal keys are
     /// all held.
     /// @throws std::runtime_error "failed to open file."; the records are unchanged
-    /// @throws std::runtime_error "failed to read from file" for an entry that is cut short, and
-    ///         where reading fails; std::invalid_argument "zero length key" for an entry without a
-    ///         key. The file is open then, and the entries before that one are held.
+    /// @throws std::runtime_error "failed to read from file" for an entry that is cut short or
+    ///         claims to be longer than the file, and where reading fails; std::invalid_argument
+    ///         "zero length key" for an entry without a key; on 32 bits std::bad_alloc for a length
+    ///         of 2 GiB or more. The file is open then, the entries before that one are held, and
+    ///         with `WRITE` the destructor writes those: `setMode(0)` first.
     void open(unsigned long mode) override;
     /// As in `File`: no stream's open mode.
     void open(std::ios_base::openmode) = delete;
 
     /// When the mode has `WRITE`: deletes the file and writes all records to a new one. In any case
-    /// destroys the records and closes the file. Without `WRITE` changes are lost silently.
+    /// destroys the records and closes the file. Without `WRITE` changes are lost silently. What
+    /// only close(2) finds, such as a quota, is in `fail()` and not thrown. Cancellation is held
+    /// off.
     /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
     ///         written, the records are held
-    /// @throws std::runtime_error "failed to open file."; the old file is gone then, the mode 0,
-    /// the
-    ///         records are held: `setMode` and another `close` try again
+    /// @throws std::runtime_error "failed to open file."; the mode is 0 then and the records held:
+    ///         `setMode` and another `close` try again. The file is gone; or as it was, if it could
+    ///         not be deleted either; or the new one, if it could be written without a stream.
     /// @throws std::runtime_error "failed to close file."
     void close() override;
 

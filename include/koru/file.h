@@ -28,8 +28,8 @@ extern KORU_EXPORT wchar_t const _COLON;
 /// operations inherited from `std::fstream` do not take it either: an object that several threads
 /// write to directly is guarded with `lock` and `unlock`.
 ///
-/// Stream errors show in the stream's state, as with any stream. `open` clears the state only when
-/// its first attempt failed and its second succeeded, so call `clear()` before you reuse an object
+/// Stream errors show in the stream's state, as with any stream. `open` clears the state only where
+/// it creates a missing file with `READ | WRITE`, so call `clear()` before you reuse an object
 /// after a failure.
 class KORU_EXPORT File : public std::fstream {
 public:
@@ -49,16 +49,17 @@ public:
     File(File const&) = delete;
     File& operator=(File const&) = delete;
 
-    /// Closes the file. What goes wrong is lost; call `close` first to see it.
+    /// Closes the file, once the lock is free; cancellation is held off. What goes wrong is lost;
+    /// call `close` first to see it.
     virtual ~File();
 
     /// Opens the file. `READ` opens an existing file; `WRITE` creates the file or empties an
     /// existing one; `READ | WRITE` opens an existing file with its content, or creates it.
     /// On a file that is already open only the remembered mode changes: the file stays open as it
-    /// was and the stream's fail state is set. A file that is there is not emptied by
-    /// `READ | WRITE`, whatever keeps it from being opened.
-    /// @throws std::runtime_error "failed to open file."; it is closed then, the mode unchanged.
-    ///         Also for a mode with neither `READ` nor `WRITE`.
+    /// was and the stream's fail state is set.
+    /// @throws std::runtime_error "failed to open file."; it is closed then, the mode unchanged,
+    ///         `errno` has the reason, and the file on the disk is as it was. Also for a mode with
+    ///         neither `READ` nor `WRITE`.
     // LogFile hides this operation on purpose; GCC reports that here, Clang there.
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Woverloaded-virtual"
@@ -90,8 +91,8 @@ public:
     /// @return false when it could not be taken
     bool lock();
 
-    /// Gives the lock back once.
-    /// @return false when that failed
+    /// Gives the lock back once. Called without holding it, nothing happens.
+    /// @return true
     bool unlock();
 
     /// A copy of the name given to the constructor.
@@ -130,8 +131,9 @@ private:
 ///
 /// A path that does not begin with `/` is relative to the directory of the running executable
 /// (`System::getProcessFileName`), not to the working directory; it is resolved with `realpath`
-/// (POSIX), and what does not exist yet is appended to what does. An absolute path is not resolved:
-/// `.`, `..` and links stay in it. Either way backslashes become slashes and repeated slashes one.
+/// (POSIX), and what does not exist yet is appended to what does; a link to what does not exist yet
+/// is followed. An absolute path is not resolved: `.`, `..` and links stay in it. Either way
+/// backslashes become slashes and repeated slashes one.
 ///
 /// Intended: a path that begins with a backslash is relative; a file directly below the root, such
 /// as /file.txt, cannot be represented; paths compare equal without regard to case.
@@ -143,7 +145,8 @@ public:
     /// Parses a path; text counts up to its first NUL, and narrow text is UTF-8.
     /// @throws std::invalid_argument "null or empty string passed as file path"
     /// @throws std::invalid_argument "cannot determine path" when no directory below the root
-    ///         remains
+    ///         remains, and for a relative path where the system tells neither the executable nor
+    ///         the working directory
     Path(std::wstring const& text);
     Path(wchar_t const* text);
     Path(std::string const& text);

@@ -35,8 +35,9 @@ class SettingsTable;
 /// table is sorted by section and key in `open` and when it is written; what is added in between
 /// stands at its end. Where several entries have equal names, the first in the table counts.
 ///
-/// Every operation holds the file's lock from its beginning to its end, so one object may be used
-/// by several threads at once. Results are copies. All operations may throw `std::bad_alloc`.
+/// Every operation of this class holds the file's lock from its beginning to its end, so one object
+/// may be used by several threads at once. Results are copies. All operations may throw
+/// `std::bad_alloc`. A thread that is cancelled in `open` leaves the mode 0: nothing is written.
 class KORU_EXPORT InitializationFile : public File {
 public:
     /// No limit is imposed on lines; published for callers.
@@ -51,25 +52,28 @@ public:
     InitializationFile(InitializationFile const&) = delete;
     InitializationFile& operator=(InitializationFile const&) = delete;
 
-    /// Does what `close` does. What goes wrong is lost; call `close` first to see it.
+    /// Does what `close` does, also when an exception between two changes destroys the object:
+    /// `setMode(0)` before gives the changes up. What goes wrong is lost; call `close` first to see
+    /// it.
     ~InitializationFile() override;
 
     /// Opens the file as `File::open` does and replaces the table: with `READ` by the entries of
     /// the file, sorted, otherwise by nothing, so that `close` then replaces the whole file.
     /// @throws std::runtime_error "failed to open file."; the table is unchanged
     /// @throws std::runtime_error "failed to read from file"; the file stays open, the table holds
-    ///         what was read
+    ///         what was read, and with `WRITE` the destructor writes that: `setMode(0)` first
     void open(unsigned long mode) override;
     /// As in `File`: no stream's open mode.
     void open(std::ios_base::openmode) = delete;
 
     /// When the mode has `WRITE`: sorts the table, deletes the file and writes it anew. In any case
-    /// empties the table and closes the file. Without `WRITE` changes are lost silently.
+    /// empties the table and closes the file. Without `WRITE` changes are lost silently. What only
+    /// close(2) finds, such as a quota, is in `fail()` and not thrown. Cancellation is held off.
     /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
     ///         written, the table intact
-    /// @throws std::runtime_error "failed to open file."; the old file is gone then, the mode 0,
-    /// the
-    ///         table intact: `setMode` and another `close` try again
+    /// @throws std::runtime_error "failed to open file."; the mode is 0 then and the table intact:
+    ///         `setMode` and another `close` try again. The file is gone; or as it was, if it could
+    ///         not be deleted either; or the new one, if it could be written without a stream.
     /// @throws std::runtime_error "failed to close file."
     void close() override;
 

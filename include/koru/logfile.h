@@ -9,10 +9,10 @@
 namespace Koru {
 
 /// A file opened so that every write goes to its end, also when other processes append to it. What
-/// a line looks like is the caller's business: write to the object as to any stream. Lines of
-/// several processes stay whole when each is flushed at its end and fits the stream's buffer. The
-/// file should exist before several processes open it: of two that find it missing at once, the
-/// later empties it.
+/// a line looks like is the caller's business: write to the object as to any stream. A line is
+/// whole among those of other processes when one `write` brings all of it and one `flush` follows;
+/// a piece of 1,024 bytes or more goes out before the rest. The file should exist before several
+/// processes open it: of two that find it missing at once, the later empties it.
 ///
 /// Intended: while the log is open its mode is 0. So `synchronize` closes it and then fails with
 /// "failed to open file.".
@@ -37,7 +37,8 @@ public:
     ~LogFile() override;
 
     /// Opens the log for appending; its own operation, which hides `File::open`. `READ | WRITE`
-    /// keeps what is there, `WRITE` alone empties the file first; both create a missing file.
+    /// keeps what is there, `WRITE` alone empties the file first; both create a missing file. A log
+    /// that is open stays so, in the fail state: it drops all output until `clear()`.
     /// @throws std::runtime_error "failed to open file."; it is closed then. Where the file itself
     ///         can be opened, as without `WRITE`, a line "File::open() failed to open " and the
     ///         name goes to standard output first.

@@ -37,7 +37,8 @@ public:
     /// @throws std::runtime_error "failed to obtain mutex within timeout"; it is not held then
     void lock(unsigned long timeout = 0xFFFFFFFFUL);
 
-    /// Gives the mutex back once. Called without holding it, nothing happens.
+    /// Gives the mutex back once. Called without holding it, nothing happens. A forked child does
+    /// not hold what its parent's thread held, and cannot take it either.
     void unlock();
 
     /// True while another thread holds the mutex. The holder itself sees false: it may lock again.

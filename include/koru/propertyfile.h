@@ -31,8 +31,9 @@ class SettingsTable;
 /// Keys compare without regard to case (`compare` of <koru/string.h>, under the current C locale)
 /// and keep the case they were given. Where several entries have equal keys, the first counts.
 ///
-/// Every operation holds the file's lock from its beginning to its end, so one object may be used
-/// by several threads at once. Results are copies. All operations may throw `std::bad_alloc`.
+/// Every operation of this class holds the file's lock from its beginning to its end, so one object
+/// may be used by several threads at once. Results are copies. All operations may throw
+/// `std::bad_alloc`. A thread that is cancelled in `open` leaves the mode 0: nothing is written.
 class KORU_EXPORT PropertyFile : public File {
 public:
     /// No limit is imposed on lines; published for callers.
@@ -47,25 +48,28 @@ public:
     PropertyFile(PropertyFile const&) = delete;
     PropertyFile& operator=(PropertyFile const&) = delete;
 
-    /// Does what `close` does. What goes wrong is lost; call `close` first to see it.
+    /// Does what `close` does, also when an exception between two changes destroys the object:
+    /// `setMode(0)` before gives the changes up. What goes wrong is lost; call `close` first to see
+    /// it.
     ~PropertyFile() override;
 
     /// Opens the file as `File::open` does and replaces the list: with `READ` by the entries of the
     /// file, otherwise by nothing, so that `close` then replaces the whole file.
     /// @throws std::runtime_error "failed to open file."; the list is unchanged
     /// @throws std::runtime_error "failed to read from file"; the file stays open, the list holds
-    ///         what was read
+    ///         what was read, and with `WRITE` the destructor writes that: `setMode(0)` first
     void open(unsigned long mode) override;
     /// As in `File`: no stream's open mode.
     void open(std::ios_base::openmode) = delete;
 
     /// When the mode has `WRITE`: deletes the file and writes it anew. In any case empties the list
-    /// and closes the file. Without `WRITE` changes are lost silently.
+    /// and closes the file. Without `WRITE` changes are lost silently. What only close(2) finds,
+    /// such as a quota, is in `fail()` and not thrown. Cancellation is held off.
     /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
     ///         written, the list intact
-    /// @throws std::runtime_error "failed to open file."; the old file is gone then, the mode 0,
-    /// the
-    ///         list intact: `setMode` and another `close` try again
+    /// @throws std::runtime_error "failed to open file."; the mode is 0 then and the list intact:
+    ///         `setMode` and another `close` try again. The file is gone; or as it was, if it could
+    ///         not be deleted either; or the new one, if it could be written without a stream.
     /// @throws std::runtime_error "failed to close file."
     void close() override;
 

@@ -2,6 +2,7 @@
 // dead thread or a full disk; and a log in several processes.
 #include <doctest/doctest.h>
 
+#include <dlfcn.h>
 #include <pthread.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -12,12 +13,12 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
-#include <filesystem>
 #include <stdexcept>
 #include <string>
 #include <thread>
 #include <type_traits>
 
+#include <koru/dynamiclibrary.h>
 #include <koru/file.h>
 #include <koru/initializationfile.h>
 #include <koru/logfile.h>
@@ -77,7 +78,7 @@ TEST_CASE("parentheses around a path of a variable declare a function, braces ma
     CHECK(same);
 }
 
-// ------------------------------------------------------------- an exception, a child, a dead thread
+// ----------------------------------------------------------- an exception, a child, a dead thread
 
 namespace {
 
@@ -136,6 +137,23 @@ TEST_CASE("a child that calls exit writes the files of static objects, one that 
     writeFile(path, "[s]\nk=old\n");
     CHECK(writtenByChild(path, [] { ::_exit(0); }) == "[s]\nk=old\n");
     CHECK(writtenByChild(path, [] { std::exit(0); }) == "[s]\nk=unfinished\n");
+}
+
+TEST_CASE("a child that calls exit writes out what its parent had buffered, as the parent does") {
+    TempDir const directory;
+    std::string const path = directory / "program.log";
+    test::Outcome const outcome = test::inChild([&] {
+        static LogFile log(path);
+        log.open(READ_WRITE);
+        put(log, "line\n");
+        pid_t const child = ::fork();
+        if (child == 0) std::exit(0);
+        ::waitpid(child, nullptr, 0);
+        log.close();
+        return 0;
+    });
+    CHECK(outcome.exitCode == 0);
+    CHECK(readFile(path) == "line\nline\n");
 }
 
 TEST_CASE("a child has lost the lock that the thread held which forked it") {
@@ -307,4 +325,16 @@ TEST_CASE("short pieces reach the system together, up to what the buffer takes")
         log.flush();
         CHECK(writes.made() == (fits ? 1 : 2));
     }
+}
+
+// --------------------------------------------------------------------------------------- libraries
+
+// The sanitizers call the loader in the program's place, and it searches for them.
+TEST_CASE("a name without a slash is not searched for in the program's own folders" *
+          doctest::skip(!test::MALLOC_CAN_FAIL)) {
+    CHECK(!Koru::DynamicLibrary(L"libkoru.so").load());
+    CHECK(Koru::DynamicLibrary(L"$ORIGIN/libkoru.so").load()); // which lies beside itself
+    void* const own = ::dlopen("libkoru.so", RTLD_LAZY);
+    CHECK(own != nullptr);
+    if (own != nullptr) ::dlclose(own);
 }
