@@ -11,23 +11,22 @@
 #include <ostream>
 #include <random>
 #include <sstream>
-#include <streambuf>
 #include <string>
 #include <vector>
 
+#include "fixedbuffer.h"
 #include "harness.h"
 
 #ifdef KORU_BENCH_HAS_FMT
-#define FMT_HEADER_ONLY
 #include <fmt/chrono.h>
 #endif
-#ifdef KORU_BENCH_HAS_BOOST_DATE_TIME
+#ifdef KORU_BENCH_HAS_BOOST
 #include <boost/date_time/posix_time/posix_time.hpp>
 #endif
 
 namespace {
 
-using bench::Rival;
+using bench::Peer;
 using bench::Work;
 
 constexpr char FORMAT[] = "%Y-%m-%d %H:%M:%S";
@@ -79,46 +78,35 @@ private:
     std::size_t at_ = 0;
 };
 
-/// Takes the characters and forgets them when it is rewound.
-class FixedBuffer : public std::streambuf {
-public:
-    FixedBuffer() { rewind(); }
-    void rewind() { setp(bytes_, bytes_ + sizeof bytes_); }
-
-private:
-    char bytes_[256];
-};
-
 void _parse(bench::Report& report, Moments moments) {
     for (Moment const& moment : moments) {
         Koru::DateTime const parsed(moment.text);
         bench::require(static_cast<long>(parsed) == static_cast<long>(moment.ours),
                        "the date was read as another one");
     }
-    std::vector<Rival> rivals = {bench::peer("strptime", Work::repeated([moments]() mutable {
-                                                 std::tm fields{};
-                                                 ::strptime(moments.next().text.c_str(), FORMAT,
-                                                            &fields);
-                                                 return fields;
-                                             })),
-                                 bench::peer("std::get_time", Work::repeated([moments]() mutable {
-                                                 std::tm fields{};
-                                                 std::istringstream in(moments.next().text);
-                                                 in >> std::get_time(&fields, FORMAT);
-                                                 return fields;
-                                             }))};
-#ifdef KORU_BENCH_HAS_BOOST_DATE_TIME
-    rivals.push_back(bench::peer("Boost time_from_string", Work::repeated([moments]() mutable {
-                                     return boost::posix_time::time_from_string(
-                                         moments.next().text);
-                                 })));
+    std::vector<Peer> peers = {bench::peer("strptime", Work::repeated([moments]() mutable {
+                                               std::tm fields{};
+                                               ::strptime(moments.next().text.c_str(), FORMAT,
+                                                          &fields);
+                                               return fields;
+                                           })),
+                               bench::peer("std::get_time", Work::repeated([moments]() mutable {
+                                               std::tm fields{};
+                                               std::istringstream in(moments.next().text);
+                                               in >> std::get_time(&fields, FORMAT);
+                                               return fields;
+                                           }))};
+#ifdef KORU_BENCH_HAS_BOOST
+    peers.push_back(bench::peer("Boost time_from_string", Work::repeated([moments]() mutable {
+                                    return boost::posix_time::time_from_string(moments.next().text);
+                                })));
 #else
-    rivals.push_back(bench::missing("Boost time_from_string"));
+    peers.push_back(bench::missing("Boost time_from_string"));
 #endif
     report.compare("parse", Work::repeated([moments]() mutable {
                        return Koru::DateTime(moments.next().text);
                    }),
-                   rivals, 0.4);
+                   peers, 0.4);
 }
 
 void _format(bench::Report& report, Moments moments) {
@@ -126,41 +114,41 @@ void _format(bench::Report& report, Moments moments) {
         std::string const text = moment.ours;
         bench::require(text == moment.text, "the date was written as another one");
     }
-    std::vector<Rival> rivals = {bench::peer("strftime", Work::repeated([moments]() mutable {
-                                                 char text[32];
-                                                 std::size_t const size =
-                                                     std::strftime(text, sizeof text, FORMAT,
-                                                                   &moments.next().fields);
-                                                 return std::string(text, size);
-                                             }))};
+    std::vector<Peer> peers = {bench::peer("strftime", Work::repeated([moments]() mutable {
+                                               char text[32];
+                                               std::size_t const size =
+                                                   std::strftime(text, sizeof text, FORMAT,
+                                                                 &moments.next().fields);
+                                               return std::string(text, size);
+                                           }))};
 #ifdef KORU_BENCH_HAS_FMT
-    rivals.push_back(bench::peer("fmt::format", Work::repeated([moments]() mutable {
-                                     return fmt::format("{:%F %T}", moments.next().fields);
-                                 })));
+    peers.push_back(bench::peer("fmt::format", Work::repeated([moments]() mutable {
+                                    return fmt::format("{:%F %T}", moments.next().fields);
+                                })));
 #else
-    rivals.push_back(bench::missing("fmt::format"));
+    peers.push_back(bench::missing("fmt::format"));
 #endif
-#ifdef KORU_BENCH_HAS_BOOST_DATE_TIME
+#ifdef KORU_BENCH_HAS_BOOST
     std::vector<boost::posix_time::ptime> times;
     for (Moment const& moment : moments) {
         times.push_back(boost::posix_time::ptime_from_tm(moment.fields));
     }
-    rivals.push_back(bench::peer(
-        "Boost to_iso_extended", Work::repeated([times, at = 0U]() mutable {
-            return boost::posix_time::to_iso_extended_string(times[at++ % times.size()]);
-        })));
+    peers.push_back(bench::peer("Boost to_iso_extended", Work::repeated([times, at = 0U]() mutable {
+                                    return boost::posix_time::to_iso_extended_string(
+                                        times[at++ % times.size()]);
+                                })));
 #else
-    rivals.push_back(bench::missing("Boost to_iso_extended"));
+    peers.push_back(bench::missing("Boost to_iso_extended"));
 #endif
     report.compare("format", Work::repeated([moments]() mutable {
                        std::string text = moments.next().ours;
                        return text;
                    }),
-                   rivals, 0.5);
+                   peers, 0.5);
 }
 
 void _stream(bench::Report& report, Moments moments) {
-    FixedBuffer buffer;
+    bench::FixedBuffer<char> buffer;
     std::ostream out(&buffer);
     report.compare("stream", Work::repeated([&] {
                        buffer.rewind();

@@ -1,10 +1,8 @@
 // Timing by turns. Only ratios that were taken within one run mean anything: the machine's speed
-// drifts, but ours and a rival that take turns drift together. So a row times ours, the rival,
-// ours, the rival, ... and reports the median of the ratios of neighbours.
+// drifts, but ours and a peer that take turns drift together. So a row times ours, the peer,
+// ours, the peer, ... and reports the median of the ratios of neighbours.
 #ifndef KORU_BENCH_HARNESS_H
 #define KORU_BENCH_HARNESS_H
-
-#include <time.h>
 
 #include <algorithm>
 #include <cstddef>
@@ -12,118 +10,34 @@
 #include <cstdlib>
 #include <cstring>
 #include <fstream>
-#include <functional>
 #include <string>
 #include <utility>
 #include <vector>
 
+#include "work.h"
+
 namespace bench {
 
-/// Makes the optimizer believe that the object is read, and any memory written.
-template <class T>
-void keep(T const& object) {
-    asm volatile("" : : "r"(&object) : "memory");
-}
-
-/// Ends the program unless the contenders agree: a rival that does something else is no measure.
-inline void require(bool condition, char const* what) {
-    if (condition) return;
-    std::fprintf(stderr, "bench: %s\n", what);
-    std::exit(1);
-}
-
-/// Seconds since its construction. A stretch that is long enough to be interrupted is measured in
-/// the thread's processor time, kernel included, so that other programs do not count; a short one
-/// by the cheaper clock, read within the other.
-class Stopwatch {
-public:
-    double seconds() const {
-        double const passed = read(CLOCK_MONOTONIC) - start_;
-        return passed < 0.0001 ? passed : read(CLOCK_THREAD_CPUTIME_ID) - processorStart_;
-    }
-
-private:
-    static double read(clockid_t clock) {
-        timespec time;
-        ::clock_gettime(clock, &time);
-        return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9;
-    }
-
-    double processorStart_ = read(CLOCK_THREAD_CPUTIME_ID);
-    double start_ = read(CLOCK_MONOTONIC);
-};
-
-/// Something that can be done over and over, and timed.
-class Work {
-public:
-    Work() = default;
-
-    /// Work that can follow on itself: the clock is read around the whole loop.
-    template <class Body>
-    static Work repeated(Body body) {
-        return Work([body](std::size_t count) mutable {
-            Stopwatch const watch;
-            for (std::size_t i = 0; i < count; ++i) keep(body());
-            return watch.seconds();
-        });
-    }
-
-    /// Work that needs a fresh state each time: only the body is timed, and costs a clock reading.
-    template <class Prepare, class Body>
-    static Work prepared(Prepare prepare, Body body) {
-        return Work([prepare, body](std::size_t count) mutable {
-            double total = 0;
-            for (std::size_t i = 0; i < count; ++i) {
-                prepare();
-                Stopwatch const watch;
-                keep(body());
-                total += watch.seconds();
-            }
-            return total;
-        });
-    }
-
-    /// The same work with something done before and after each series, untimed.
-    template <class Before, class After>
-    Work within(Before before, After after) const {
-        return Work([time = time_, before, after](std::size_t count) mutable {
-            before();
-            double const seconds = time(count);
-            after();
-            return seconds;
-        });
-    }
-
-    /// The seconds that so many runs took.
-    double time(std::size_t count) const { return time_(count); }
-
-    explicit operator bool() const { return static_cast<bool>(time_); }
-
-private:
-    explicit Work(std::function<double(std::size_t)> time) : time_(std::move(time)) {}
-
-    std::function<double(std::size_t)> time_;
-};
-
-/// Someone to be compared with. Of the rivals for one job the fastest is the one that the job's
-/// goal speaks of; a limit (the same bytes through the cheapest primitive) has a goal of its own.
-struct Rival {
+/// Someone to be compared with. Of the peers for one job the fastest is the one that the job's goal
+/// speaks of; a limit (the same bytes through the cheapest primitive, or something that does a part
+/// of the job) has a goal of its own.
+struct Peer {
     std::string name;
-    Work work;          ///< empty when this machine lacks the library
-    double goal = 0;    ///< a limit's own goal; 0 for none
-    bool limit = false; ///< whether it stands beside the contest for the fastest
+    Work work;            ///< empty when this machine lacks the library
+    bool isLimit = false; ///< whether it stands beside the contest for the fastest
+    double goal = 0;      ///< a limit's own goal; 0 for none
 };
 
-inline Rival peer(std::string name, Work work) {
-    return {std::move(name), std::move(work), 0, false};
+inline Peer peer(std::string name, Work work) {
+    return {std::move(name), std::move(work), false, 0};
 }
-inline Rival limit(std::string name, Work work, double goal = 0) {
-    return {std::move(name), std::move(work), goal, true};
+inline Peer limit(std::string name, Work work, double goal = 0) {
+    return {std::move(name), std::move(work), true, goal};
 }
-inline Rival missing(std::string name) { return {std::move(name), Work(), 0, false}; }
+inline Peer missing(std::string name) { return {std::move(name), Work(), false, 0}; }
 
-/// The command line of a benchmark: `[--quick] [--all] [--rounds=N] [filter]`. Rows whose name
-/// contains the filter are run.
+/// The command line of a benchmark: `[--quick] [--all] [--rounds=N] [--results=FILE] [filter]`.
+/// Rows whose name contains the filter are run.
 class Options {
 public:
     Options(int argc, char** argv) {
@@ -132,10 +46,12 @@ public:
 
     /// Fewer rounds: to see that all of it runs, not for numbers.
     bool quick() const { return quick_; }
-    /// Shows every rival; otherwise only the fastest peer, the limits and who is missing.
+    /// Shows every peer; otherwise only the fastest one, the limits and who is missing.
     bool all() const { return all_; }
     /// At least; quick work gets up to five times as many.
     std::size_t rounds() const { return rounds_; }
+    /// Where every comparison is added as a line, for script/bench to sum up; empty for nowhere.
+    std::string const& results() const { return results_; }
     bool wants(std::string const& row) const { return row.find(filter_) != std::string::npos; }
 
 private:
@@ -147,6 +63,8 @@ private:
             all_ = true;
         } else if (std::strncmp(argument, "--rounds=", 9) == 0) {
             rounds_ = std::max<std::size_t>(1, std::strtoul(argument + 9, nullptr, 10));
+        } else if (std::strncmp(argument, "--results=", 10) == 0) {
+            results_ = argument + 10;
         } else {
             filter_ = argument;
         }
@@ -155,31 +73,42 @@ private:
     bool quick_ = false;
     bool all_ = false;
     std::size_t rounds_ = 9;
+    std::string results_;
     std::string filter_;
 };
 
-/// One row of the table: ours against one rival.
+/// One row of the table: ours against one peer.
 struct Row {
     std::string job;
-    std::string rival;
+    std::string peer;
+    bool isLimit = false;
     double ours = 0;   ///< median, in seconds for one piece of work
     double theirs = 0; ///< the same
-    double ratio = 0;  ///< median of ours / theirs, neighbours in time
+    double ratio = 0;  ///< median of ours / theirs, neighbours in time; 0 when skipped
     double spread = 0; ///< the middle half of those ratios, as a part of their median
     double goal = 0;   ///< 0 for none
+
+    /// As good as met: what is left of the goal is within what two runs differ by.
+    bool near() const { return ratio <= 1.1 * goal; }
+    char const* verdict() const {
+        if (ratio == 0 || goal == 0) return "";
+        return ratio <= goal ? "met" : near() ? "near" : "MISSED";
+    }
 };
 
 /// Runs the rows of one program and prints them as a table that Markdown understands too.
 class Report {
 public:
-    Report(char const* title, Options options) : options_(std::move(options)) {
-        std::printf("%s: %s, %s, %s, %u-bit%s\n\n", title, processor().c_str(), compiler(),
+    /// @param family  what the program measures; its name in the results
+    Report(char const* family, Options options) : family_(family), options_(std::move(options)) {
+        std::printf("%s: %s, %s, %s, %u-bit%s\n\n", family, processor().c_str(), compiler(),
                     KORU_BENCH_FLAGS, static_cast<unsigned>(8 * sizeof(void*)),
                     options_.quick() ? ", QUICK: not for numbers" : "");
-        std::printf("| %-38s | %9s | %-26s | %9s | %6s | %6s | %5s | %-6s |\n", "work", "ours",
-                    "rival", "theirs", "ratio", "spread", "goal", "");
-        std::printf("|:%s|%s:|:%s|%s:|%s:|%s:|%s:|:%s|\n", dashes(39), dashes(10), dashes(27),
+        std::printf("| %-44s | %9s | %-26s | %9s | %6s | %6s | %5s | %-6s |\n", "work", "ours",
+                    "peer", "theirs", "ratio", "spread", "goal", "");
+        std::printf("|:%s|%s:|:%s|%s:|%s:|%s:|%s:|:%s|\n", dashes(45), dashes(10), dashes(27),
                     dashes(10), dashes(7), dashes(7), dashes(6), dashes(7));
+        if (!options_.results().empty()) results_.open(options_.results(), std::ios::app);
     }
 
     Report(Report const&) = delete;
@@ -194,57 +123,62 @@ public:
                     static_cast<unsigned>(goals_), missed_.empty() ? "" : "; missed, worst first:");
         for (Row const& row : missed_) {
             std::printf("- %s, against %s: %.2f instead of %.2f\n", row.job.c_str(),
-                        row.rival.c_str(), row.ratio, row.goal);
+                        row.peer.c_str(), row.ratio, row.goal);
         }
     }
 
     Options const& options() const { return options_; }
     bool wants(std::string const& job) const { return options_.wants(job); }
 
-    /// Compares ours with each rival.
+    /// Compares ours with each peer.
     /// @param goal   the ratio to reach against the fastest peer; 0 for none
     /// @param units  pieces in one run of the work; the times are given for one
-    void compare(std::string const& job, Work const& ours, std::vector<Rival> const& rivals,
+    void compare(std::string const& job, Work const& ours, std::vector<Peer> const& peers,
                  double goal = 0, double units = 1) {
         if (!wants(job)) return;
         std::vector<Row> rows;
-        for (Rival const& rival : rivals) rows.push_back(measure(job, ours, rival, units));
-        std::size_t const fastest = fastestPeer(rows, rivals);
+        for (Peer const& peer : peers) {
+            rows.push_back(measure(job, ours, peer, units));
+            if (!peer.isLimit) rows.back().goal = goal;
+        }
+        std::size_t const fastest = fastestPeer(rows);
         for (std::size_t i = 0; i < rows.size(); ++i) {
-            if (i == fastest) rows[i].goal = goal;
-            bool const others = !rivals[i].limit && rivals[i].work && i != fastest;
-            if (!others || options_.all()) print(rows[i]);
+            record(rows[i]);
+            bool const beaten = !rows[i].isLimit && rows[i].ratio != 0 && i != fastest;
+            if (beaten) rows[i].goal = 0;
+            if (!beaten || options_.all()) print(rows[i]);
         }
         std::fflush(stdout);
     }
 
 private:
     /// The index of the peer that comes off best against ours, by the ratios, since only they hold
-    /// on a busy machine; the number of rivals when none takes part.
-    static std::size_t fastestPeer(std::vector<Row> const& rows, std::vector<Rival> const& rivals) {
+    /// on a busy machine; the number of rows when none takes part.
+    static std::size_t fastestPeer(std::vector<Row> const& rows) {
         std::size_t fastest = rows.size();
         for (std::size_t i = 0; i < rows.size(); ++i) {
-            if (rivals[i].limit || !rivals[i].work) continue;
+            if (rows[i].isLimit || rows[i].ratio == 0) continue;
             if (fastest == rows.size() || rows[i].ratio > rows[fastest].ratio) fastest = i;
         }
         return fastest;
     }
 
-    Row measure(std::string const& job, Work const& ours, Rival const& rival, double units) {
+    Row measure(std::string const& job, Work const& ours, Peer const& peer, double units) {
         Row row;
         row.job = job;
-        row.rival = rival.name;
-        row.goal = rival.goal;
-        if (!rival.work) return row;
+        row.peer = peer.name;
+        row.isLimit = peer.isLimit;
+        row.goal = peer.goal;
+        if (!peer.work) return row;
         std::size_t const ourCount = calibrate(ours);
-        std::size_t const theirCount = calibrate(rival.work);
+        std::size_t const theirCount = calibrate(peer.work);
         std::vector<double> ourTimes;
         std::vector<double> theirTimes;
         std::vector<double> ratios;
         Stopwatch const watch;
         while (goesOn(ratios.size(), watch.seconds())) {
             ourTimes.push_back(ours.time(ourCount) / static_cast<double>(ourCount) / units);
-            theirTimes.push_back(rival.work.time(theirCount) / static_cast<double>(theirCount) /
+            theirTimes.push_back(peer.work.time(theirCount) / static_cast<double>(theirCount) /
                                  units);
             ratios.push_back(ourTimes.back() / theirTimes.back());
         }
@@ -273,23 +207,32 @@ private:
         }
     }
 
+    /// Family, job, peer, kind, nanoseconds of both, ratio, spread and goal, between tabs. Every
+    /// peer has the job's goal here: which one is the fastest is for the sum of several runs to
+    /// say.
+    void record(Row const& row) {
+        if (!results_.is_open()) return;
+        results_ << family_ << '\t' << row.job << '\t' << row.peer << '\t'
+                 << (row.isLimit ? "limit" : "peer") << '\t' << 1e9 * row.ours << '\t'
+                 << 1e9 * row.theirs << '\t' << row.ratio << '\t' << row.spread << '\t' << row.goal
+                 << std::endl;
+    }
+
     void print(Row const& row) {
         if (row.ratio == 0) {
-            std::printf("| %-38s | %9s | %-26s | %9s | %6s | %6s | %5s | %-6s |\n", row.job.c_str(),
-                        "-", row.rival.c_str(), "skipped", "-", "-", "-", "");
+            std::printf("| %-44s | %9s | %-26s | %9s | %6s | %6s | %5s | %-6s |\n", row.job.c_str(),
+                        "-", row.peer.c_str(), "skipped", "-", "-", "-", "");
             return;
         }
-        bool const met = row.ratio <= row.goal;
         char goal[16] = "-";
         if (row.goal > 0) {
             std::snprintf(goal, sizeof goal, "%.2f", row.goal);
             ++goals_;
-            if (!met) missed_.push_back(row);
+            if (!row.near()) missed_.push_back(row);
         }
-        std::printf("| %-38s | %9s | %-26s | %9s | %6.2f | %5.1f%% | %5s | %-6s |\n",
-                    row.job.c_str(), duration(row.ours).c_str(), row.rival.c_str(),
-                    duration(row.theirs).c_str(), row.ratio, 100 * row.spread, goal,
-                    row.goal > 0 ? (met ? "met" : "MISSED") : "");
+        std::printf("| %-44s | %9s | %-26s | %9s | %6.2f | %5.1f%% | %5s | %-6s |\n",
+                    row.job.c_str(), duration(row.ours).c_str(), row.peer.c_str(),
+                    duration(row.theirs).c_str(), row.ratio, 100 * row.spread, goal, row.verdict());
     }
 
     static double quantile(std::vector<double> values, double part) {
@@ -331,11 +274,13 @@ private:
     }
 
     static char const* dashes(std::size_t count) {
-        static char const dashes[] = "----------------------------------------";
+        static char const dashes[] = "--------------------------------------------------";
         return dashes + (sizeof dashes - 1 - count);
     }
 
+    char const* family_;
     Options options_;
+    std::ofstream results_;
     std::size_t goals_ = 0;
     std::vector<Row> missed_;
 };

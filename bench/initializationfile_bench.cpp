@@ -1,5 +1,5 @@
-// Settings files with sections: load, look up, change, save and the whole cycle, from 50 to 200,000
-// entries.
+// Settings files with sections: load, get, set, save and the whole cycle, from one entry to
+// 200,000.
 //
 // What is compared: our names and values are wide at the interface, and names match without regard
 // to case. SimpleIni (CSimpleIniCaseA with SetUnicode, its variant for narrow UTF-8), GKeyFile and
@@ -11,31 +11,29 @@
 #include <koru/string.h>
 
 #include <fcntl.h>
-#include <stdlib.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstdint>
+#include <cstddef>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <memory>
 #include <random>
-#include <stdexcept>
 #include <string>
-#include <utility>
+#include <string_view>
 #include <vector>
 
+#include "convert.h"
 #include "harness.h"
+#include "memorydirectory.h"
+#include "settingswork.h"
 
 #ifdef KORU_BENCH_HAS_SIMPLEINI
-#define SI_NO_CONVERSION  // no wide variant, which would need a library
 #define SI_IMPLEMENTATION // as Debian packages it: the bodies, for the word size of this program
 #include <SimpleIni.h>
 #endif
-#ifdef KORU_BENCH_HAS_PROPERTY_TREE
+#ifdef KORU_BENCH_HAS_BOOST
 #include <boost/property_tree/ini_parser.hpp>
 #include <boost/property_tree/ptree.hpp>
 #endif
@@ -45,32 +43,12 @@
 
 namespace {
 
-using bench::Rival;
+using bench::MemoryDirectory;
+using bench::Peer;
 using bench::Work;
-
-/// A directory in memory where there is one, or the disk would be measured.
-class MemoryDirectory {
-public:
-    MemoryDirectory() {
-        if (::access("/dev/shm", W_OK) == 0)
-            path_ = "/dev/shm";
-        else
-            path_ = std::filesystem::temp_directory_path().string();
-        path_ += "/koru-bench-XXXXXX";
-        bench::require(::mkdtemp(&path_[0]) != nullptr, "cannot make a temporary directory");
-    }
-    MemoryDirectory(MemoryDirectory const&) = delete;
-    MemoryDirectory& operator=(MemoryDirectory const&) = delete;
-    ~MemoryDirectory() {
-        std::error_code ignored;
-        std::filesystem::remove_all(path_, ignored);
-    }
-
-    std::string operator/(std::string const& name) const { return path_ + "/" + name; }
-
-private:
-    std::string path_;
-};
+using Goals = bench::SettingsGoals;
+using Step = bench::SettingsStep;
+using Value = bench::SettingsValue;
 
 /// Names in both forms, and a value.
 struct Entry {
@@ -121,6 +99,8 @@ std::vector<Entry> _shuffled(std::vector<Entry> entries) {
     return entries;
 }
 
+using Task = bench::SettingsTask<Entry>;
+
 void _write(std::string const& path, std::vector<Entry> const& entries) {
     std::ofstream out(path);
     std::string const* section = nullptr;
@@ -135,8 +115,7 @@ void _write(std::string const& path, std::vector<Entry> const& entries) {
     bench::require(!out.fail(), "cannot write a settings file");
 }
 
-// The contenders. Each is made for a path and used once. get gives the size of a value; find, of
-// those with narrow names, hands the value to a function.
+// The libraries. Those with narrow names have a function find that hands the value to a function.
 
 class Ours {
 public:
@@ -148,8 +127,8 @@ public:
     std::size_t get(Entry const& entry) {
         return file_.getValue(entry.wideSection, entry.wideKey).size();
     }
-    void set(Entry const& entry, std::wstring const& value) {
-        file_.setValue(entry.wideSection, entry.wideKey, value);
+    void set(Entry const& entry, Value const& value) {
+        file_.setValue(entry.wideSection, entry.wideKey, value.wide);
     }
     void save() { file_.close(); }
     /// Before the object is destroyed without being saved: the destructor would write.
@@ -189,7 +168,7 @@ private:
 };
 #endif
 
-#ifdef KORU_BENCH_HAS_PROPERTY_TREE
+#ifdef KORU_BENCH_HAS_BOOST
 class PropertyTree {
 public:
     static constexpr char const* name = "Boost.PropertyTree";
@@ -258,9 +237,6 @@ private:
 };
 #endif
 
-std::size_t _size(char const* text) { return std::strlen(text); }
-std::size_t _size(std::string const& text) { return text.size(); }
-
 /// A narrow library on its own terms.
 template <class Settings>
 class Narrow : public Settings {
@@ -268,10 +244,11 @@ public:
     using Settings::Settings;
 
     std::size_t get(Entry const& entry) {
-        return this->find(entry.section, entry.key, [](auto const& value) { return _size(value); });
+        return this->find(entry.section, entry.key,
+                          [](std::string_view value) { return value.size(); });
     }
-    void set(Entry const& entry, std::wstring const& value) {
-        Settings::set(entry.section, entry.key, Koru::make_string(value));
+    void set(Entry const& entry, Value const& value) {
+        Settings::set(entry.section, entry.key, value.narrow);
     }
     void abandon() {}
 };
@@ -283,230 +260,55 @@ public:
     using Settings::Settings;
 
     std::size_t get(Entry const& entry) {
-        return this->find(Koru::make_string(entry.wideSection), Koru::make_string(entry.wideKey),
-                          [](auto const& value) { return Koru::make_wstring(value).size(); });
+        return this->find(bench::narrow(entry.wideSection), bench::narrow(entry.wideKey),
+                          [](std::string_view value) { return bench::widen(value).size(); });
     }
-    void set(Entry const& entry, std::wstring const& value) {
-        Settings::set(Koru::make_string(entry.wideSection), Koru::make_string(entry.wideKey),
-                      Koru::make_string(value));
+    void set(Entry const& entry, Value const& value) {
+        Settings::set(bench::narrow(entry.wideSection), bench::narrow(entry.wideKey),
+                      bench::narrow(value.wide));
     }
     void abandon() {}
 };
 
-/// A file and what is done with it: 1,000 look-ups and 100 changes, spread over all entries.
-class Task {
-public:
-    Task(MemoryDirectory const& directory, std::string const& name,
-         std::vector<Entry> const& entries)
-        : path_(directory / name), bytes_(0) {
-        _write(path_, entries);
-        bytes_ = static_cast<std::size_t>(std::filesystem::file_size(path_));
-        std::mt19937 random(2);
-        for (int i = 0; i < 1000; ++i) lookedUp_.push_back(entries[random() % entries.size()]);
-        for (int i = 0; i < 100; ++i) changed_.push_back(entries[random() % entries.size()]);
-    }
-
-    std::string const& path() const { return path_; }
-    std::size_t bytes() const { return bytes_; }
-
-    template <class Settings>
-    std::size_t lookUpOne(Settings& settings) const {
-        return settings.get(lookedUp_.front());
-    }
-
-    template <class Settings>
-    std::size_t lookUp(Settings& settings) const {
-        std::size_t total = 0;
-        for (Entry const& entry : lookedUp_) total += settings.get(entry);
-        return total;
-    }
-
-    /// Changes values to text of the same length, so that the file keeps its size, and to another
-    /// text than the last time.
-    template <class Settings>
-    void change(Settings& settings) const {
-        static std::wstring const values[] = {L"/var/cache/application/changed",
-                                              L"/var/cache/application/another"};
-        turn_ = 1 - turn_;
-        for (Entry const& entry : changed_) settings.set(entry, values[turn_]);
-    }
-
-    static constexpr double lookUps = 1000;
-    static constexpr double changes = 100;
-
-private:
-    std::string path_;
-    std::size_t bytes_;
-    std::vector<Entry> lookedUp_;
-    std::vector<Entry> changed_;
-    mutable std::size_t turn_ = 0;
-};
-
-/// A fresh object for each run, on a copy of the file that is this contender's own, since each
-/// writes it a little differently. Destroying the last object is part of the preparation.
+/// Adds a library to the peers, at look-ups also on its own terms.
 template <class Settings>
-class Slot {
-public:
-    explicit Slot(Task const& task) : task_(&task), path_(task.path() + "." + Settings::name) {
-        std::filesystem::copy_file(task.path(), path_,
-                                   std::filesystem::copy_options::overwrite_existing);
-    }
-    Slot(Slot const&) = delete;
-    Slot& operator=(Slot const&) = delete;
-    ~Slot() { clear(); }
-
-    void clear() {
-        if (settings_) settings_->abandon();
-        settings_.reset();
-    }
-    Settings& load() {
-        settings_ = std::make_unique<Settings>(path_);
-        settings_->load();
-        return *settings_;
-    }
-    /// Loads, and does whatever was put off until the first look-up.
-    Settings& loadReady() {
-        task_->lookUpOne(load());
-        return *settings_;
-    }
-    Settings& settings() { return *settings_; }
-    Task const& task() const { return *task_; }
-    std::string const& path() const { return path_; }
-
-private:
-    Task const* task_;
-    std::string path_;
-    std::unique_ptr<Settings> settings_;
-};
-
-enum class Step { load, firstLookUp, lookUp, change, save, cycle };
-
-/// From nothing to a filled table.
-template <class Settings>
-Work _load(std::shared_ptr<Slot<Settings>> slot) {
-    return Work::prepared([slot] { slot->clear(); }, [slot] { return &slot->load(); });
+void _add(std::vector<Peer>& peers, Task const& task, Step step) {
+    peers.push_back(bench::settingsPeer<Wide<Settings>, Ours>(task, step));
+    if (step != Step::warmGet) return;
+    peers.push_back(bench::limit(std::string(Settings::name) + ", narrow",
+                                 bench::settingsWork<Narrow<Settings>>(task, step)));
 }
 
-/// One look-up, and whatever loading put off until then.
-template <class Settings>
-Work _firstLookUp(std::shared_ptr<Slot<Settings>> slot) {
-    return Work::prepared(
-        [slot] {
-            slot->clear();
-            slot->load();
-        },
-        [slot] { return slot->task().lookUpOne(slot->settings()); });
-}
-
-template <class Settings>
-Work _lookUp(std::shared_ptr<Slot<Settings>> slot) {
-    return Work::repeated([slot] { return slot->task().lookUp(slot->settings()); })
-        .within([slot] { slot->loadReady(); }, [slot] { slot->clear(); });
-}
-
-template <class Settings>
-Work _change(std::shared_ptr<Slot<Settings>> slot) {
-    return Work::prepared(
-        [slot] {
-            slot->clear();
-            slot->loadReady();
-        },
-        [slot] {
-            slot->task().change(slot->settings());
-            return 0;
-        });
-}
-
-/// From a changed table to a closed file.
-template <class Settings>
-Work _save(std::shared_ptr<Slot<Settings>> slot) {
-    return Work::prepared(
-        [slot] {
-            slot->clear();
-            slot->task().change(slot->load());
-        },
-        [slot] {
-            slot->settings().save();
-            return 0;
-        });
-}
-
-/// What a program does in its life: everything, the destruction included.
-template <class Settings>
-Work _cycle(std::shared_ptr<Slot<Settings>> slot) {
-    return Work::repeated([slot] {
-        Settings settings(slot->path());
-        settings.load();
-        std::size_t const size = slot->task().lookUp(settings);
-        slot->task().change(settings);
-        settings.save();
-        return size;
-    });
-}
-
-template <class Settings>
-Work _work(Task const& task, Step step) {
-    auto const slot = std::make_shared<Slot<Settings>>(task);
-    switch (step) {
-    case Step::load:
-        return _load(slot);
-    case Step::firstLookUp:
-        return _firstLookUp(slot);
-    case Step::lookUp:
-        return _lookUp(slot);
-    case Step::change:
-        return _change(slot);
-    case Step::save:
-        return _save(slot);
-    case Step::cycle:
-        break;
-    }
-    return _cycle(slot);
-}
-
-/// Ends the program unless a contender finds what we find.
-template <class Settings>
-void _check(Task const& task) {
-    Slot<Ours> ours(task);
-    Slot<Settings> theirs(task);
-    bench::require(task.lookUp(ours.load()) == task.lookUp(theirs.load()), Settings::name);
-}
-
-/// Adds a library to the rivals, at look-ups also on its own terms.
-template <class Settings>
-void _add(std::vector<Rival>& rivals, Task const& task, Step step) {
-    _check<Wide<Settings>>(task);
-    rivals.push_back(bench::peer(Settings::name, _work<Wide<Settings>>(task, step)));
-    if (step != Step::lookUp) return;
-    rivals.push_back(bench::limit(std::string(Settings::name) + ", narrow",
-                                  _work<Narrow<Settings>>(task, step)));
-}
-
-std::vector<Rival> _rivals([[maybe_unused]] Task const& task, [[maybe_unused]] Step step) {
-    std::vector<Rival> rivals;
+std::vector<Peer> _peers([[maybe_unused]] Task const& task, [[maybe_unused]] Step step) {
+    std::vector<Peer> peers;
 #ifdef KORU_BENCH_HAS_SIMPLEINI
-    _add<SimpleIni>(rivals, task, step);
+    _add<SimpleIni>(peers, task, step);
 #else
-    rivals.push_back(bench::missing("SimpleIni"));
+    peers.push_back(bench::missing("SimpleIni"));
 #endif
-#ifdef KORU_BENCH_HAS_PROPERTY_TREE
-    _add<PropertyTree>(rivals, task, step);
+#ifdef KORU_BENCH_HAS_BOOST
+    _add<PropertyTree>(peers, task, step);
 #else
-    rivals.push_back(bench::missing("Boost.PropertyTree"));
+    peers.push_back(bench::missing("Boost.PropertyTree"));
 #endif
 #ifdef KORU_BENCH_HAS_GLIB
-    _add<KeyFile>(rivals, task, step);
+    _add<KeyFile>(peers, task, step);
 #else
-    rivals.push_back(bench::missing("GLib GKeyFile"));
+    peers.push_back(bench::missing("GLib GKeyFile"));
 #endif
-    return rivals;
+    return peers;
 }
 
-void _readWhole(Task const& task, std::vector<char>& bytes) {
-    int const file = ::open(task.path().c_str(), O_RDONLY | O_CLOEXEC);
+void _readWhole(std::string const& path, std::vector<char>& bytes) {
+    int const file = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
     ssize_t const n = ::read(file, bytes.data(), bytes.size());
     ::close(file);
     bench::require(n == static_cast<ssize_t>(bytes.size()), "cannot read a settings file");
+}
+
+/// Memory for the whole file.
+std::vector<char> _bytesOf(std::string const& path) {
+    return std::vector<char>(static_cast<std::size_t>(std::filesystem::file_size(path)));
 }
 
 std::size_t _countLines(std::vector<char> const& bytes) {
@@ -522,35 +324,28 @@ std::size_t _countLines(std::vector<char> const& bytes) {
 }
 
 /// Reading the file, into memory that is there already, and finding its lines.
-Rival _readLimit(Task const& task, double goal) {
-    std::vector<char> bytes(task.bytes());
-    return bench::limit("read + memchr", Work::repeated([&task, bytes]() mutable {
-                            _readWhole(task, bytes);
-                            return _countLines(bytes);
-                        }),
-                        goal);
+Peer _readLimit(Task const& task, double goal) {
+    auto const read = [path = task.path(), bytes = _bytesOf(task.path())]() mutable {
+        _readWhole(path, bytes);
+        return _countLines(bytes);
+    };
+    return bench::limit("read + memchr", Work::repeated(read), goal);
 }
 
 /// Replacing the file by bytes that are ready.
-Rival _writeLimit(Task const& task, double goal) {
-    std::vector<char> bytes(task.bytes());
-    _readWhole(task, bytes);
-    return bench::limit("unlink + one write", Work::repeated([&task, bytes] {
-                            ::unlink(task.path().c_str());
-                            int const file = ::open(task.path().c_str(),
-                                                    O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
-                            ssize_t const n = ::write(file, bytes.data(), bytes.size());
-                            ::close(file);
-                            bench::require(n == static_cast<ssize_t>(bytes.size()), "write");
-                            return n;
-                        }),
-                        goal);
+Peer _writeLimit(Task const& task, double goal) {
+    std::vector<char> bytes = _bytesOf(task.path());
+    _readWhole(task.path(), bytes);
+    auto const write = [path = task.path(), bytes] {
+        ::unlink(path.c_str());
+        int const file = ::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
+        ssize_t const n = ::write(file, bytes.data(), bytes.size());
+        ::close(file);
+        bench::require(n == static_cast<ssize_t>(bytes.size()), "write");
+        return n;
+    };
+    return bench::limit("unlink + one write", Work::repeated(write), goal);
 }
-
-/// Ratios to reach; 0 for none.
-struct Goals {
-    double load, lookUp, save, cycle, loadLimit, saveLimit;
-};
 
 struct Size {
     std::size_t entries;
@@ -558,56 +353,49 @@ struct Size {
     Goals goals;
 };
 
-void _sizes(bench::Report& report, MemoryDirectory const& directory, Size const& size) {
-    std::string const prefix = std::string(size.name) + ", ";
-    std::vector<std::pair<Step, std::string>> const steps = {
-        {Step::load, prefix + "load"},      {Step::firstLookUp, prefix + "first look-up"},
-        {Step::lookUp, prefix + "look up"}, {Step::change, prefix + "change"},
-        {Step::save, prefix + "save"},      {Step::cycle, prefix + "whole cycle"}};
-    if (std::none_of(steps.begin(), steps.end(),
-                     [&report](auto const& step) { return report.wants(step.second); })) {
-        return;
-    }
-    Task const task(directory, "settings.ini", _entries(size.entries));
-    for (auto const& [step, row] : steps) {
-        if (!report.wants(row)) continue;
-        std::vector<Rival> rivals = _rivals(task, step);
-        Goals const& goals = size.goals;
-        if (step == Step::load) rivals.push_back(_readLimit(task, goals.loadLimit));
-        if (step == Step::save) rivals.push_back(_writeLimit(task, goals.saveLimit));
-        double const goal = step == Step::load     ? goals.load
-                            : step == Step::lookUp ? goals.lookUp
-                            : step == Step::save   ? goals.save
-                            : step == Step::cycle  ? goals.cycle
-                                                   : 0;
-        double const units = step == Step::lookUp   ? Task::lookUps
-                             : step == Step::change ? Task::changes
-                                                    : 1;
-        report.compare(row, _work<Ours>(task, step), rivals, goal, units);
-    }
+void _step(bench::Report& report, Task const& task, Size const& size, Step step) {
+    std::string const row = std::string(size.name) + ", " + bench::nameOf(step);
+    if (!report.wants(row)) return;
+    std::vector<Peer> peers = _peers(task, step);
+    if (step == Step::load) peers.push_back(_readLimit(task, size.goals.loadLimit));
+    if (step == Step::save) peers.push_back(_writeLimit(task, size.goals.saveLimit));
+    report.compare(row, bench::settingsWork<Ours>(task, step), peers,
+                   bench::goalOf(step, size.goals), bench::unitsOf(step, task));
+}
+
+void _size(bench::Report& report, MemoryDirectory const& directory, Size const& size) {
+    std::vector<Entry> const entries = _entries(size.entries);
+    std::string const path = directory / "settings.ini";
+    _write(path, entries);
+    Task const task(path, entries);
+    for (Step const step : bench::settingsSteps) _step(report, task, size, step);
 }
 
 void _unsorted(bench::Report& report, MemoryDirectory const& directory) {
-    std::string const row = "20,000 entries, unsorted, load";
-    if (!report.wants(row)) return;
-    Task const task(directory, "unsorted.ini", _shuffled(_entries(20000)));
-    report.compare(row, _work<Ours>(task, Step::load), _rivals(task, Step::load), 0.6);
+    std::vector<Entry> const entries = _shuffled(_entries(20000));
+    std::string const path = directory / "unsorted.ini";
+    _write(path, entries);
+    Task const task(path, entries);
+    report.compare("20,000 entries, unsorted, load", bench::settingsWork<Ours>(task, Step::load),
+                   _peers(task, Step::load), 0.6);
 }
 
 } // namespace
 
 int main(int argc, char** argv) {
-    bench::Report report("Koru initializationfile", bench::Options(argc, argv));
+    bench::Report report("settings", bench::Options(argc, argv));
     MemoryDirectory const directory;
     static Size const sizes[] = {
-        {50, "50 entries", {0.55, 0.9, 1.0, 0.8, 0, 0}},
-        {1000, "1,000 entries", {0.15, 0.75, 0.30, 0.32, 0, 0}},
-        {20000, "20,000 entries", {0.25, 1.1, 0.27, 0.28, 5, 4}},
-        {200000, "200,000 entries", {0.25, 3, 0.27, 0.26, 0, 0}},
+        // load, get, set, save, cycle; load and save against their limits
+        {1, "1 entry", {0, 1.0, 0.85, 0, 1.0, 2.3, 1.9}},
+        {50, "50 entries", {0.55, 1.0, 0.8, 1.0, 0.8, 2.7, 2.5}},
+        {1000, "1,000 entries", {0.15, 0.85, 0.65, 0.30, 0.34, 4.0, 4.2}},
+        {20000, "20,000 entries", {0.25, 1.6, 1.5, 0.27, 0.28, 5, 6}},
+        {200000, "200,000 entries", {0.25, 8, 3.5, 0.27, 0.26, 0, 0}},
     };
     for (Size const& size : sizes) {
         if (report.options().quick() && size.entries > 20000) continue;
-        _sizes(report, directory, size);
+        _size(report, directory, size);
     }
     _unsorted(report, directory);
 }

@@ -52,7 +52,7 @@ struct Stamp {
 
 enum class Line { narrow, flushed, stamped };
 
-// The contenders. Each is made for a path, empties the file, and writes lines.
+// The stores. Each is made for a path, empties the file, and writes lines.
 
 class Ours {
 public:
@@ -179,7 +179,7 @@ Work _work(std::string const& path, Line line) {
         .within(open, close);
 }
 
-bench::Rival _spdlog([[maybe_unused]] std::string const& path, [[maybe_unused]] Line line) {
+bench::Peer _spdlog([[maybe_unused]] std::string const& path, [[maybe_unused]] Line line) {
 #ifdef KORU_BENCH_HAS_SPDLOG
     return bench::peer("spdlog", _work<Spdlog>(path, line));
 #else

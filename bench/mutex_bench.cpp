@@ -1,4 +1,4 @@
-// Mutex: lock and unlock without a contender, free and nested.
+// Mutex: lock and unlock without a one, free and nested.
 #include <koru/mutex.h>
 
 #include <pthread.h>

@@ -9,14 +9,18 @@
 #include <cstring>
 #include <ostream>
 #include <random>
-#include <streambuf>
 #include <string>
 #include <vector>
 
+#include "fixedbuffer.h"
 #include "harness.h"
+#include "qt.h"
 
-#ifdef KORU_BENCH_HAS_BOOST_LOCALE
+#ifdef KORU_BENCH_HAS_BOOST
 #include <boost/locale/encoding_utf.hpp>
+#endif
+#ifdef KORU_BENCH_HAS_ICU
+#include <unicode/ustring.h>
 #endif
 #ifdef KORU_BENCH_HAS_UTFCPP
 #include <utf8.h>
@@ -24,7 +28,8 @@
 
 namespace {
 
-using bench::Rival;
+using bench::FixedBuffer;
+using bench::Peer;
 using bench::Work;
 
 /// Words of one script, strung together to any size.
@@ -32,6 +37,13 @@ struct Script {
     char const* name;
     std::vector<std::wstring> words;
 };
+
+/// Plain words, nineteen in twenty, so that one character in a hundred is not ASCII.
+std::vector<std::wstring> _oneInAHundred() {
+    std::vector<std::wstring> words(19, L"word ");
+    words.push_back(L"café ");
+    return words;
+}
 
 std::vector<Script> _scripts() {
     return {
@@ -41,6 +53,7 @@ std::vector<Script> _scripts() {
          {L"Größe ", L"über ",    L"naïve ",     L"façade ",  L"señor ", L"mañana ", L"zażółć ",
           L"gęślą ", L"příliš ",  L"žluťoučký ", L"smörgås ", L"crème ", L"the ",    L"and ",
           L"Preis ", L"12,50 € ", L"été ",       L"für ",     L"niño ",  L"kůň "}},
+        {"1% accents", _oneInAHundred()},
         {"CJK",
          {L"設定", L"檔案", L"讀取", L"日本語", L"文字列", L"변환", L"한국어", L"路徑", L"，",
           L"。"}},
@@ -110,40 +123,80 @@ struct Sample {
     std::string narrow;
     std::vector<wchar_t> wideBuffer;
     std::vector<char> narrowBuffer;
+    std::vector<char16_t> utf16;
 
     explicit Sample(std::wstring text)
         : wide(std::move(text)), narrow(Koru::make_string(wide)), wideBuffer(wide.size() + 1),
-          narrowBuffer(narrow.size() + 1) {}
+          narrowBuffer(narrow.size() + 1), utf16(2 * wide.size() + 1) {}
 };
 
-/// A rival whose answer is ours. The function makes a string from the sample.
+/// A peer whose answer is ours. The function makes a string from the sample.
 template <class Result, class Convert>
-Rival _converter(char const* name, Result const& expected, Convert convert) {
+Peer _converter(char const* name, Result const& expected, Convert convert) {
     bench::require(convert() == expected, name);
     return bench::peer(name, Work::repeated(convert));
 }
 
-Rival _boostDecoder(Sample const& s) {
-#ifdef KORU_BENCH_HAS_BOOST_LOCALE
+#ifdef KORU_BENCH_HAS_ICU
+/// By way of UTF-16, which is what ICU converts from and to.
+std::wstring _icuDecode(Sample& s) {
+    UErrorCode error = U_ZERO_ERROR;
+    std::int32_t units = 0;
+    std::int32_t size = 0;
+    u_strFromUTF8(s.utf16.data(), static_cast<std::int32_t>(s.utf16.size()), &units,
+                  s.narrow.data(), static_cast<std::int32_t>(s.narrow.size()), &error);
+    u_strToWCS(s.wideBuffer.data(), static_cast<std::int32_t>(s.wideBuffer.size()), &size,
+               s.utf16.data(), units, &error);
+    return std::wstring(s.wideBuffer.data(), static_cast<std::size_t>(size));
+}
+
+std::string _icuEncode(Sample& s) {
+    UErrorCode error = U_ZERO_ERROR;
+    std::int32_t units = 0;
+    std::int32_t size = 0;
+    u_strFromWCS(s.utf16.data(), static_cast<std::int32_t>(s.utf16.size()), &units, s.wide.data(),
+                 static_cast<std::int32_t>(s.wide.size()), &error);
+    u_strToUTF8(s.narrowBuffer.data(), static_cast<std::int32_t>(s.narrowBuffer.size()), &size,
+                s.utf16.data(), units, &error);
+    return std::string(s.narrowBuffer.data(), static_cast<std::size_t>(size));
+}
+#endif
+
+Peer _icuDecoder([[maybe_unused]] Sample& s) {
+#ifdef KORU_BENCH_HAS_ICU
+    return _converter("ICU", s.wide, [&s] { return _icuDecode(s); });
+#else
+    return bench::missing("ICU");
+#endif
+}
+
+Peer _icuEncoder([[maybe_unused]] Sample& s) {
+#ifdef KORU_BENCH_HAS_ICU
+    return _converter("ICU", s.narrow, [&s] { return _icuEncode(s); });
+#else
+    return bench::missing("ICU");
+#endif
+}
+
+Peer _boostDecoder([[maybe_unused]] Sample const& s) {
+#ifdef KORU_BENCH_HAS_BOOST
     return _converter("Boost.Locale utf_to_utf", s.wide,
                       [&s] { return boost::locale::conv::utf_to_utf<wchar_t>(s.narrow); });
 #else
-    static_cast<void>(s);
     return bench::missing("Boost.Locale utf_to_utf");
 #endif
 }
 
-Rival _boostEncoder(Sample const& s) {
-#ifdef KORU_BENCH_HAS_BOOST_LOCALE
+Peer _boostEncoder([[maybe_unused]] Sample const& s) {
+#ifdef KORU_BENCH_HAS_BOOST
     return _converter("Boost.Locale utf_to_utf", s.narrow,
                       [&s] { return boost::locale::conv::utf_to_utf<char>(s.wide); });
 #else
-    static_cast<void>(s);
     return bench::missing("Boost.Locale utf_to_utf");
 #endif
 }
 
-Rival _utfcppDecoder(Sample const& s) {
+Peer _utfcppDecoder([[maybe_unused]] Sample const& s) {
 #ifdef KORU_BENCH_HAS_UTFCPP
     return _converter("utfcpp utf8to32", s.wide, [&s] {
         std::wstring result;
@@ -152,12 +205,11 @@ Rival _utfcppDecoder(Sample const& s) {
         return result;
     });
 #else
-    static_cast<void>(s);
     return bench::missing("utfcpp utf8to32");
 #endif
 }
 
-Rival _utfcppEncoder(Sample const& s) {
+Peer _utfcppEncoder([[maybe_unused]] Sample const& s) {
 #ifdef KORU_BENCH_HAS_UTFCPP
     return _converter("utfcpp utf32to8", s.narrow, [&s] {
         std::string result;
@@ -166,12 +218,11 @@ Rival _utfcppEncoder(Sample const& s) {
         return result;
     });
 #else
-    static_cast<void>(s);
     return bench::missing("utfcpp utf32to8");
 #endif
 }
 
-Rival _libraryDecoder(Sample& s) {
+Peer _libraryDecoder(Sample& s) {
     if (!_hasUtf8Locale()) return bench::missing("mbstowcs (C.UTF-8)");
     return bench::peer("mbstowcs (C.UTF-8)", _inUtf8Locale(Work::repeated([&s] {
                            std::size_t const n = std::mbstowcs(
@@ -180,7 +231,7 @@ Rival _libraryDecoder(Sample& s) {
                        })));
 }
 
-Rival _libraryEncoder(Sample& s) {
+Peer _libraryEncoder(Sample& s) {
     if (!_hasUtf8Locale()) return bench::missing("wcstombs (C.UTF-8)");
     return bench::peer("wcstombs (C.UTF-8)", _inUtf8Locale(Work::repeated([&s] {
                            std::size_t const n = std::wcstombs(
@@ -190,7 +241,7 @@ Rival _libraryEncoder(Sample& s) {
 }
 
 /// The wide side of the text, moved and nothing else.
-Rival _move(Sample& s, double goal) {
+Peer _move(Sample& s, double goal) {
     return bench::limit("memcpy of the wide text", Work::repeated([&s] {
                             bench::keep(s.wide);
                             std::memcpy(s.wideBuffer.data(), s.wide.data(),
@@ -212,7 +263,8 @@ void _decode(bench::Report& report, std::string const& row, Sample& s, Goals goa
         row, Work::repeated([&s] { return Koru::make_wstring(s.narrow); }),
         {_boostDecoder(s),
          _converter("iconv", s.wide, [&] { return converter.convert(s.narrow, s.wideBuffer); }),
-         _utfcppDecoder(s), _libraryDecoder(s), _move(s, goals.limit)},
+         _icuDecoder(s), bench::peer("Qt", bench::qtDecode(s.narrow)), _utfcppDecoder(s),
+         _libraryDecoder(s), _move(s, goals.limit)},
         goals.peer);
 }
 
@@ -223,7 +275,8 @@ void _encode(bench::Report& report, std::string const& row, Sample& s, Goals goa
         row, Work::repeated([&s] { return Koru::make_string(s.wide); }),
         {_boostEncoder(s),
          _converter("iconv", s.narrow, [&] { return converter.convert(s.wide, s.narrowBuffer); }),
-         _utfcppEncoder(s), _libraryEncoder(s), _move(s, goals.limit)},
+         _icuEncoder(s), bench::peer("Qt", bench::qtEncode(s.wide)), _utfcppEncoder(s),
+         _libraryEncoder(s), _move(s, goals.limit)},
         goals.peer);
 }
 
@@ -241,9 +294,10 @@ struct ConversionGoal {
 
 Goals _goalOf(std::string const& text, bool decoding) {
     static ConversionGoal const goals[] = {
-        {"ASCII, 12 B", {1.15, 0}, {0.85, 0}},
+        {"ASCII, 12 characters", {1.15, 0}, {0.85, 0}},
         {"ASCII, 64 B", {0.7, 0}, {0.6, 0}},
         {"ASCII, 4 KB", {0.30, 3.2}, {0.38, 3.8}},
+        {"1% accents, 64 K characters", {0.48, 0}, {0.55, 0}},
         {"European, 64 K characters", {0.6, 0}, {0.25, 0}},
         {"CJK, 64 K characters", {0.75, 0}, {0.4, 0}},
     };
@@ -255,7 +309,7 @@ Goals _goalOf(std::string const& text, bool decoding) {
 
 void _conversions(bench::Report& report) {
     static std::size_t const any = static_cast<std::size_t>(-1);
-    static Size const sizes[] = {{"12 B", 12, any},
+    static Size const sizes[] = {{"12 characters", any, 12},
                                  {"64 B", 64, any},
                                  {"4 KB", 4096, any},
                                  {"64 K characters", any, 65536},
@@ -270,7 +324,7 @@ void _conversions(bench::Report& report) {
     }
 }
 
-/// The rivals are pure functions: without the barriers the compiler would call them once.
+/// The peers are pure functions: without the barriers the compiler would call them once.
 template <class String, class Compare>
 Work _comparison(String const& a, String const& b, Compare compare) {
     return Work::repeated([&a, &b, compare] {
@@ -280,100 +334,100 @@ Work _comparison(String const& a, String const& b, Compare compare) {
     });
 }
 
-void _compareWide(bench::Report& report, std::string const& row, std::wstring const& a,
-                  std::wstring const& b, double goal) {
-    report.compare(
-        row,
-        _comparison(
-            a, b, [](std::wstring const& x, std::wstring const& y) { return Koru::compare(x, y); }),
-        {bench::peer("wcscasecmp", _comparison(a, b,
-                                               [](std::wstring const& x, std::wstring const& y) {
-                                                   return ::wcscasecmp(x.c_str(), y.c_str());
-                                               }))},
-        goal);
+/// @param goal   against the fastest peer
+/// @param limit  against the C library, which is none
+void _compareWide(bench::Report& report, std::string const& text, std::wstring const& a,
+                  std::wstring const& b, double goal, double limit = 0) {
+    auto const ours = [](std::wstring const& x, std::wstring const& y) {
+        return Koru::compare(x, y);
+    };
+    auto const library = [](std::wstring const& x, std::wstring const& y) {
+        return ::wcscasecmp(x.c_str(), y.c_str());
+    };
+    report.compare("compare wide, " + text, _comparison(a, b, ours),
+                   {bench::peer("QString", bench::qtCompare(a, b)),
+                    bench::limit("wcscasecmp", _comparison(a, b, library), limit)},
+                   goal);
 }
 
-void _compareNarrow(bench::Report& report, std::string const& row, std::string const& a,
+void _compareNarrow(bench::Report& report, std::string const& text, std::string const& a,
                     std::string const& b, double goal) {
-    report.compare(
-        row,
-        _comparison(a, b,
-                    [](std::string const& x, std::string const& y) { return Koru::compare(x, y); }),
-        {bench::peer("strcasecmp", _comparison(a, b,
-                                               [](std::string const& x, std::string const& y) {
-                                                   return ::strcasecmp(x.c_str(), y.c_str());
-                                               }))},
-        goal);
+    auto const ours = [](std::string const& x, std::string const& y) {
+        return Koru::compare(x, y);
+    };
+    auto const library = [](std::string const& x, std::string const& y) {
+        return ::strcasecmp(x.c_str(), y.c_str());
+    };
+    report.compare("compare narrow, " + text, _comparison(a, b, ours),
+                   {bench::peer("strcasecmp", _comparison(a, b, library))}, goal);
 }
 
 void _comparisons(bench::Report& report) {
-    _compareWide(report, "compare wide, 16, equal but for case", L"ConnectionLimits",
-                 L"cONNECTIONlIMITS", 0.12);
-    _compareWide(report, "compare wide, 16, identical", L"ConnectionLimits", L"ConnectionLimits",
-                 0);
-    _compareWide(report, "compare wide, 16, second differs", L"ConnectionLimits",
-                 L"CacheSizeMegaByt", 0);
-    _compareNarrow(report, "compare narrow, 16, equal but for case", "ConnectionLimits",
-                   "cONNECTIONlIMITS", 1.35);
-    _compareNarrow(report, "compare narrow, 16, identical", "ConnectionLimits", "ConnectionLimits",
-                   0);
-    _compareNarrow(report, "compare narrow, 16, second differs", "ConnectionLimits",
-                   "CacheSizeMegaByt", 1.35);
+    _compareWide(report, "16, equal but for case", L"ConnectionLimits", L"cONNECTIONlIMITS", 0.27,
+                 0.12);
+    _compareWide(report, "16, identical", L"ConnectionLimits", L"ConnectionLimits", 0);
+    _compareWide(report, "16, early difference", L"ConnectionLimits", L"CacheSizeMegaByt", 0.75);
+    _compareWide(report, "16, late difference", L"ConnectionLimits", L"ConnectionLimitz", 0.27);
+    _compareWide(report, "6, equal but for case", L"Height", L"hEIGHT", 0);
+    _compareWide(report, "6, late difference", L"Height", L"Heighs", 0.5);
+    _compareNarrow(report, "16, equal but for case", "ConnectionLimits", "cONNECTIONlIMITS", 1.35);
+    _compareNarrow(report, "16, identical", "ConnectionLimits", "ConnectionLimits", 0);
+    _compareNarrow(report, "16, early difference", "ConnectionLimits", "CacheSizeMegaByt", 1.35);
 }
 
-/// A stream's buffer of fixed size that is written from its start over and over, so that no growth
-/// is timed.
-class FixedBuffer : public std::streambuf {
-public:
-    FixedBuffer() { rewind(); }
-    void rewind() { setp(bytes_, bytes_ + sizeof bytes_); }
-
-private:
-    char bytes_[256];
-};
-
-void _inserters(bench::Report& report) {
-    FixedBuffer buffer;
-    std::ostream out(&buffer);
-    std::string const narrow(100, 'x');
+void _insertWide(bench::Report& report, FixedBuffer<char>& buffer, std::ostream& out) {
     std::wstring const wide(100, L'x');
-    report.compare("insert wide, 100", Work::repeated([&] {
-                       buffer.rewind();
-                       Koru::operator<<(out, wide);
-                       return out.good();
-                   }),
-                   {bench::limit("narrowing loop + sputn", Work::repeated([&] {
-                                     char bytes[100];
-                                     buffer.rewind();
-                                     bench::keep(wide);
-                                     for (std::size_t i = 0; i < wide.size(); ++i) {
-                                         bytes[i] = static_cast<char>(wide[i]);
-                                     }
-                                     return out.rdbuf()->sputn(bytes, sizeof bytes);
-                                 }),
-                                 1.25)});
-    report.compare("insert narrow, 100", Work::repeated([&] {
-                       buffer.rewind();
-                       Koru::operator<<(out, narrow);
-                       return out.good();
-                   }),
-                   {bench::limit("sputn", Work::repeated([&] {
-                                     buffer.rewind();
-                                     return out.rdbuf()->sputn(narrow.data(), 100);
-                                 }),
-                                 1.6),
-                    bench::limit("std::operator<<", Work::repeated([&] {
-                                     buffer.rewind();
-                                     std::operator<<(out, narrow);
-                                     return out.good();
-                                 }))});
+    auto const ours = [&] {
+        buffer.rewind();
+        Koru::operator<<(out, wide);
+        return out.good();
+    };
+    auto const converted = [&] {
+        buffer.rewind();
+        out << std::string(wide.begin(), wide.end());
+        return out.good();
+    };
+    FixedBuffer<wchar_t> wideBuffer;
+    std::wostream wideOut(&wideBuffer);
+    auto const sputn = [&] {
+        wideBuffer.rewind();
+        return wideOut.rdbuf()->sputn(wide.data(), 100);
+    };
+    report.compare("insert wide, 100", Work::repeated(ours),
+                   {bench::peer("<< of a std::string", Work::repeated(converted)),
+                    bench::limit("sputn to a wide stream", Work::repeated(sputn), 0.6)},
+                   0.4);
+}
+
+void _insertNarrow(bench::Report& report, FixedBuffer<char>& buffer, std::ostream& out) {
+    std::string const narrow(100, 'x');
+    auto const ours = [&] {
+        buffer.rewind();
+        Koru::operator<<(out, narrow);
+        return out.good();
+    };
+    auto const standard = [&] {
+        buffer.rewind();
+        std::operator<<(out, narrow);
+        return out.good();
+    };
+    auto const sputn = [&] {
+        buffer.rewind();
+        return out.rdbuf()->sputn(narrow.data(), 100);
+    };
+    report.compare("insert narrow, 100", Work::repeated(ours),
+                   {bench::peer("std::operator<<", Work::repeated(standard)),
+                    bench::limit("sputn", Work::repeated(sputn), 1.9)});
 }
 
 } // namespace
 
 int main(int argc, char** argv) {
-    bench::Report report("Koru string", bench::Options(argc, argv));
+    bench::Report report("strings", bench::Options(argc, argv));
     _conversions(report);
     _comparisons(report);
-    _inserters(report);
+    FixedBuffer<char> buffer;
+    std::ostream out(&buffer);
+    _insertWide(report, buffer, out);
+    _insertNarrow(report, buffer, out);
 }

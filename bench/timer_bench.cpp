@@ -6,31 +6,20 @@
 #include <chrono>
 #include <cstdio>
 #include <ostream>
-#include <streambuf>
 #include <vector>
 
+#include "fixedbuffer.h"
 #include "harness.h"
 
 #ifdef KORU_BENCH_HAS_FMT
-#define FMT_HEADER_ONLY
 #include <fmt/format.h>
 #endif
 
 namespace {
 
-using bench::Rival;
+using bench::Peer;
 using bench::Work;
 using Clock = std::chrono::steady_clock;
-
-/// Takes the characters and forgets them when it is rewound.
-class FixedBuffer : public std::streambuf {
-public:
-    FixedBuffer() { rewind(); }
-    void rewind() { setp(bytes_, bytes_ + sizeof bytes_); }
-
-private:
-    char bytes_[256];
-};
 
 double _secondsSince(Clock::time_point start) {
     return std::chrono::duration<double>(Clock::now() - start).count();
@@ -47,38 +36,38 @@ void _construct(bench::Report& report) {
 }
 
 void _constructAndPrint(bench::Report& report) {
-    FixedBuffer buffer;
+    bench::FixedBuffer<char> buffer;
     std::ostream out(&buffer);
-    std::vector<Rival> rivals;
+    std::vector<Peer> peers;
 #ifdef KORU_BENCH_HAS_FMT
-    rivals.push_back(bench::peer("steady_clock + fmt", Work::repeated([&] {
-                                     Clock::time_point const start = Clock::now();
-                                     buffer.rewind();
-                                     char text[32];
-                                     auto const end = fmt::format_to_n(text, sizeof text, "{:.3f}",
-                                                                       _secondsSince(start));
-                                     out.write(text, static_cast<std::streamsize>(end.size));
-                                     return 0;
-                                 })));
+    peers.push_back(bench::peer("steady_clock + fmt", Work::repeated([&] {
+                                    Clock::time_point const start = Clock::now();
+                                    buffer.rewind();
+                                    char text[32];
+                                    auto const end = fmt::format_to_n(text, sizeof text, "{:.3f}",
+                                                                      _secondsSince(start));
+                                    out.write(text, static_cast<std::streamsize>(end.size));
+                                    return 0;
+                                })));
 #else
-    rivals.push_back(bench::missing("steady_clock + fmt"));
+    peers.push_back(bench::missing("steady_clock + fmt"));
 #endif
-    rivals.push_back(bench::peer("steady_clock + snprintf", Work::repeated([&] {
-                                     Clock::time_point const start = Clock::now();
-                                     buffer.rewind();
-                                     char text[32];
-                                     int const size = std::snprintf(text, sizeof text, "%.3f",
-                                                                    _secondsSince(start));
-                                     out.write(text, size);
-                                     return 0;
-                                 })));
+    peers.push_back(bench::peer("steady_clock + snprintf", Work::repeated([&] {
+                                    Clock::time_point const start = Clock::now();
+                                    buffer.rewind();
+                                    char text[32];
+                                    int const size = std::snprintf(text, sizeof text, "%.3f",
+                                                                   _secondsSince(start));
+                                    out.write(text, size);
+                                    return 0;
+                                })));
     report.compare("construct and print", Work::repeated([&] {
                        Koru::Timer const timer;
                        buffer.rewind();
                        out << timer;
                        return 0;
                    }),
-                   rivals, 1.0);
+                   peers, 1.0);
 }
 
 } // namespace

@@ -6,13 +6,13 @@
 #include <cstring>
 #include <ostream>
 #include <random>
-#include <streambuf>
 #include <string>
 #include <vector>
 
+#include "fixedbuffer.h"
 #include "harness.h"
 
-#ifdef KORU_BENCH_HAS_BOOST_UUID
+#ifdef KORU_BENCH_HAS_BOOST
 #include <boost/uuid/string_generator.hpp>
 #include <boost/uuid/uuid.hpp>
 #include <boost/uuid/uuid_io.hpp>
@@ -23,7 +23,7 @@
 
 namespace {
 
-using bench::Rival;
+using bench::Peer;
 using bench::Work;
 
 using Bytes = std::array<unsigned char, 16>;
@@ -33,7 +33,7 @@ struct Identifier {
     Bytes bytes;
     std::string text;
     Koru::Uuid ours;
-#ifdef KORU_BENCH_HAS_BOOST_UUID
+#ifdef KORU_BENCH_HAS_BOOST
     boost::uuids::uuid boost;
 #endif
 };
@@ -53,7 +53,7 @@ Identifier _identifier(Bytes const& bytes) {
     char text[36];
     identifier.text.assign(text, _hyphenated(bytes, text));
     identifier.ours = Koru::Uuid(std::vector<unsigned char>(bytes.begin(), bytes.end()));
-#ifdef KORU_BENCH_HAS_BOOST_UUID
+#ifdef KORU_BENCH_HAS_BOOST
     std::copy(bytes.begin(), bytes.end(), identifier.boost.begin());
 #endif
     return identifier;
@@ -82,43 +82,33 @@ private:
     std::size_t at_ = 0;
 };
 
-/// Takes the characters and forgets them when it is rewound.
-class FixedBuffer : public std::streambuf {
-public:
-    FixedBuffer() { rewind(); }
-    void rewind() { setp(bytes_, bytes_ + sizeof bytes_); }
-
-private:
-    char bytes_[256];
-};
-
 void _parse(bench::Report& report, Identifiers identifiers) {
     for (Identifier const& identifier : identifiers) {
         bench::require(Koru::Uuid(identifier.text) == identifier.ours,
                        "the identifier was read as another one");
     }
-    std::vector<Rival> rivals;
+    std::vector<Peer> peers;
 #ifdef KORU_BENCH_HAS_LIBUUID
-    rivals.push_back(bench::peer("libuuid", Work::repeated([identifiers]() mutable {
-                                     Bytes bytes;
-                                     ::uuid_parse(identifiers.next().text.c_str(), bytes.data());
-                                     return bytes;
-                                 })));
+    peers.push_back(bench::peer("libuuid", Work::repeated([identifiers]() mutable {
+                                    Bytes bytes;
+                                    ::uuid_parse(identifiers.next().text.c_str(), bytes.data());
+                                    return bytes;
+                                })));
 #else
-    rivals.push_back(bench::missing("libuuid"));
+    peers.push_back(bench::missing("libuuid"));
 #endif
-#ifdef KORU_BENCH_HAS_BOOST_UUID
-    rivals.push_back(bench::peer("Boost", Work::repeated([identifiers]() mutable {
-                                     return boost::uuids::string_generator()(
-                                         identifiers.next().text);
-                                 })));
+#ifdef KORU_BENCH_HAS_BOOST
+    peers.push_back(bench::peer("Boost", Work::repeated([identifiers]() mutable {
+                                    return boost::uuids::string_generator()(
+                                        identifiers.next().text);
+                                })));
 #else
-    rivals.push_back(bench::missing("Boost"));
+    peers.push_back(bench::missing("Boost"));
 #endif
     report.compare("parse", Work::repeated([identifiers]() mutable {
                        return Koru::Uuid(identifiers.next().text);
                    }),
-                   rivals, 0.5);
+                   peers, 0.5);
 }
 
 void _format(bench::Report& report, Identifiers identifiers) {
@@ -126,80 +116,80 @@ void _format(bench::Report& report, Identifiers identifiers) {
         std::string const text = identifier.ours;
         bench::require(text == identifier.text, "the identifier was written as another one");
     }
-    std::vector<Rival> rivals;
+    std::vector<Peer> peers;
 #ifdef KORU_BENCH_HAS_LIBUUID
-    rivals.push_back(bench::peer("libuuid", Work::repeated([identifiers]() mutable {
-                                     char text[37];
-                                     ::uuid_unparse_lower(identifiers.next().bytes.data(), text);
-                                     return std::string(text, 36);
-                                 })));
+    peers.push_back(bench::peer("libuuid", Work::repeated([identifiers]() mutable {
+                                    char text[37];
+                                    ::uuid_unparse_lower(identifiers.next().bytes.data(), text);
+                                    return std::string(text, 36);
+                                })));
 #else
-    rivals.push_back(bench::missing("libuuid"));
+    peers.push_back(bench::missing("libuuid"));
 #endif
-#ifdef KORU_BENCH_HAS_BOOST_UUID
-    rivals.push_back(bench::peer("Boost", Work::repeated([identifiers]() mutable {
-                                     return boost::uuids::to_string(identifiers.next().boost);
-                                 })));
+#ifdef KORU_BENCH_HAS_BOOST
+    peers.push_back(bench::peer("Boost", Work::repeated([identifiers]() mutable {
+                                    return boost::uuids::to_string(identifiers.next().boost);
+                                })));
 #else
-    rivals.push_back(bench::missing("Boost"));
+    peers.push_back(bench::missing("Boost"));
 #endif
-    rivals.push_back(bench::limit("copy of the text", Work::repeated([identifiers]() mutable {
-                                      return std::string(identifiers.next().text);
-                                  })));
+    peers.push_back(bench::limit("copy of the text", Work::repeated([identifiers]() mutable {
+                                     return std::string(identifiers.next().text);
+                                 })));
     report.compare("format", Work::repeated([identifiers]() mutable {
                        std::string text = identifiers.next().ours;
                        return text;
                    }),
-                   rivals, 1.05);
+                   peers, 1.05);
 }
 
 void _stream(bench::Report& report, Identifiers identifiers) {
-    FixedBuffer buffer;
+    bench::FixedBuffer<char> buffer;
     std::ostream out(&buffer);
-    std::vector<Rival> rivals;
-#ifdef KORU_BENCH_HAS_BOOST_UUID
-    rivals.push_back(bench::peer("Boost", Work::repeated([&] {
-                                     buffer.rewind();
-                                     out << identifiers.next().boost;
-                                     return 0;
-                                 })));
+    std::vector<Peer> peers;
+#ifdef KORU_BENCH_HAS_BOOST
+    peers.push_back(bench::peer("Boost", Work::repeated([&] {
+                                    buffer.rewind();
+                                    out << identifiers.next().boost;
+                                    return 0;
+                                })));
 #else
-    rivals.push_back(bench::missing("Boost"));
+    peers.push_back(bench::missing("Boost"));
 #endif
-    rivals.push_back(bench::limit("sputn of the text", Work::repeated([&] {
-                                      std::string const& text = identifiers.next().text;
-                                      buffer.rewind();
-                                      return out.rdbuf()->sputn(text.data(), 36);
-                                  })));
+    peers.push_back(bench::limit("sputn of the text", Work::repeated([&] {
+                                     std::string const& text = identifiers.next().text;
+                                     buffer.rewind();
+                                     return out.rdbuf()->sputn(text.data(), 36);
+                                 })));
     report.compare("stream", Work::repeated([&] {
                        buffer.rewind();
                        out << identifiers.next().ours;
                        return 0;
                    }),
-                   rivals, 0.06);
+                   peers, 0.06);
 }
 
 /// Boost's comparison is inlined into the application, which no library call can match: a limit.
 void _compare(bench::Report& report, Identifiers const& identifiers) {
     std::vector<Identifier> const one(identifiers.begin(), identifiers.end());
     std::vector<Identifier> const other = one;
-    std::vector<Rival> rivals;
+    std::vector<Peer> peers;
 #ifdef KORU_BENCH_HAS_LIBUUID
-    rivals.push_back(bench::peer("libuuid", Work::repeated([&one, &other, at = 0U]() mutable {
-                                     std::size_t const i = at++ % one.size();
-                                     return ::uuid_compare(one[i].bytes.data(),
-                                                           other[i].bytes.data()) == 0;
-                                 })));
+    peers.push_back(bench::peer("libuuid", Work::repeated([&one, &other, at = 0U]() mutable {
+                                    std::size_t const i = at++ % one.size();
+                                    return ::uuid_compare(one[i].bytes.data(),
+                                                          other[i].bytes.data()) == 0;
+                                })));
 #else
-    rivals.push_back(bench::missing("libuuid"));
+    peers.push_back(bench::missing("libuuid"));
 #endif
-    rivals.push_back(bench::limit("memcmp", Work::repeated([&one, &other, at = 0U]() mutable {
-                                      std::size_t const i = at++ % one.size();
-                                      return std::memcmp(one[i].bytes.data(), other[i].bytes.data(),
-                                                         16);
-                                  })));
-#ifdef KORU_BENCH_HAS_BOOST_UUID
-    rivals.push_back(
+    peers.push_back(bench::limit("memcmp", Work::repeated([&one, &other, at = 0U]() mutable {
+                                     std::size_t const i = at++ % one.size();
+                                     return std::memcmp(one[i].bytes.data(), other[i].bytes.data(),
+                                                        16);
+                                 })));
+#ifdef KORU_BENCH_HAS_BOOST
+    peers.push_back(
         bench::limit("Boost, inlined", Work::repeated([&one, &other, at = 0U]() mutable {
                          std::size_t const i = at++ % one.size();
                          return one[i].boost == other[i].boost;
@@ -209,7 +199,7 @@ void _compare(bench::Report& report, Identifiers const& identifiers) {
                        std::size_t const i = at++ % one.size();
                        return one[i].ours == other[i].ours;
                    }),
-                   rivals, 0.6);
+                   peers, 0.6);
 }
 
 } // namespace
