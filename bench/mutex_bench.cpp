@@ -4,13 +4,19 @@
 #include <pthread.h>
 
 #include <condition_variable>
+#include <memory>
 #include <mutex>
 #include <thread>
 
 #include "harness.h"
 
+#ifdef KORU_BENCH_HAS_POCO
+#include <Poco/Mutex.h>
+#endif
+
 namespace {
 
+using bench::Peer;
 using bench::Work;
 
 /// A second thread that sleeps: while a process has but one, the C library may take its
@@ -60,7 +66,6 @@ public:
     PosixMutex& operator=(PosixMutex const&) = delete;
 
     void lock() { ::pthread_mutex_lock(&mutex_); }
-    bool tryLock() { return ::pthread_mutex_trylock(&mutex_) == 0; }
     void unlock() { ::pthread_mutex_unlock(&mutex_); }
 
 private:
@@ -68,44 +73,52 @@ private:
 };
 
 template <class Mutex>
-Work _cycle(Mutex& mutex) {
-    return Work::repeated([&mutex] {
-        mutex.lock();
-        mutex.unlock();
+Work _cycle() {
+    auto const mutex = std::make_shared<Mutex>();
+    return Work::repeated([mutex] {
+        mutex->lock();
+        mutex->unlock();
         return 0;
     });
 }
 
+/// The same with a lock around all of it.
+template <class Mutex>
+Work _nestedCycle() {
+    auto const mutex = std::make_shared<Mutex>();
+    auto const cycle = [mutex] {
+        mutex->lock();
+        mutex->unlock();
+        return 0;
+    };
+    return Work::repeated(cycle).within([mutex] { mutex->lock(); }, [mutex] { mutex->unlock(); });
+}
+
+template <class Mutex>
+Work _work(bool nested) {
+    return nested ? _nestedCycle<Mutex>() : _cycle<Mutex>();
+}
+
+Peer _poco([[maybe_unused]] bool nested) {
+#ifdef KORU_BENCH_HAS_POCO
+    return bench::peer("POCO", _work<Poco::Mutex>(nested));
+#else
+    return bench::missing("POCO");
+#endif
+}
+
 void _uncontended(bench::Report& report, char const* row, bool nested, double goal) {
-    Koru::Mutex ours;
-    std::recursive_mutex standard;
-    PosixMutex posix;
-    if (nested) {
-        ours.lock();
-        standard.lock();
-        posix.lock();
-    }
-    report.compare(row, _cycle(ours),
-                   {bench::peer("std::recursive_mutex", _cycle(standard)),
-                    bench::peer("pthread, recursive", _cycle(posix)),
-                    bench::limit("pthread trylock + unlock", Work::repeated([&posix] {
-                                     bool const locked = posix.tryLock();
-                                     posix.unlock();
-                                     return locked;
-                                 }))},
+    report.compare(row, _work<Koru::Mutex>(nested),
+                   {bench::peer("std::recursive_mutex", _work<std::recursive_mutex>(nested)),
+                    bench::peer("pthread, recursive", _work<PosixMutex>(nested)), _poco(nested)},
                    goal);
-    if (nested) {
-        ours.unlock();
-        standard.unlock();
-        posix.unlock();
-    }
 }
 
 } // namespace
 
 int main(int argc, char** argv) {
     Bystander const bystander;
-    bench::Report report("Koru mutex", bench::Options(argc, argv));
+    bench::Report report("mutexes", bench::Options(argc, argv));
     _uncontended(report, "lock + unlock, free", false, 1.15);
     _uncontended(report, "lock + unlock, nested", true, 1.5);
 }

@@ -16,8 +16,9 @@ Work qtEncode(std::wstring const& text);
 /// Compares without regard to case.
 Work qtCompare(std::wstring const& a, std::wstring const& b);
 
-/// Identifiers from their text forms, in turn.
+/// Identifiers from their text forms, in turn: as the strings of Qt, and as views of bytes.
 Work qtParse(std::vector<std::string> const& texts);
+Work qtParseLatin1(std::vector<std::string> const& texts);
 
 /// The text forms of identifiers that have these, in turn.
 Work qtFormat(std::vector<std::string> const& texts);

@@ -67,13 +67,13 @@ void _constructAndPrint(bench::Report& report) {
                        out << timer;
                        return 0;
                    }),
-                   peers, 1.0);
+                   peers, 1.6);
 }
 
 } // namespace
 
 int main(int argc, char** argv) {
-    bench::Report report("Koru timer", bench::Options(argc, argv));
+    bench::Report report("timers", bench::Options(argc, argv));
     _construct(report);
     _constructAndPrint(report);
 }

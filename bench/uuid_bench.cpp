@@ -11,6 +11,7 @@
 
 #include "fixedbuffer.h"
 #include "harness.h"
+#include "qt.h"
 
 #ifdef KORU_BENCH_HAS_BOOST
 #include <boost/uuid/string_generator.hpp>
@@ -74,6 +75,11 @@ public:
     Identifier const& next() { return identifiers_[at_++ % COUNT]; }
     Identifier const* begin() const { return identifiers_.data(); }
     Identifier const* end() const { return identifiers_.data() + COUNT; }
+    std::vector<std::string> texts() const {
+        std::vector<std::string> texts;
+        for (Identifier const& identifier : identifiers_) texts.push_back(identifier.text);
+        return texts;
+    }
 
 private:
     static constexpr std::size_t COUNT = 64;
@@ -87,7 +93,9 @@ void _parse(bench::Report& report, Identifiers identifiers) {
         bench::require(Koru::Uuid(identifier.text) == identifier.ours,
                        "the identifier was read as another one");
     }
-    std::vector<Peer> peers;
+    std::vector<Peer> peers = {
+        bench::peer("Qt, of a QByteArray", bench::qtParse(identifiers.texts())),
+        bench::limit("Qt, of a view", bench::qtParseLatin1(identifiers.texts()))};
 #ifdef KORU_BENCH_HAS_LIBUUID
     peers.push_back(bench::peer("libuuid", Work::repeated([identifiers]() mutable {
                                     Bytes bytes;
@@ -108,7 +116,7 @@ void _parse(bench::Report& report, Identifiers identifiers) {
     report.compare("parse", Work::repeated([identifiers]() mutable {
                        return Koru::Uuid(identifiers.next().text);
                    }),
-                   peers, 0.5);
+                   peers, 0.4);
 }
 
 void _format(bench::Report& report, Identifiers identifiers) {
@@ -116,7 +124,7 @@ void _format(bench::Report& report, Identifiers identifiers) {
         std::string const text = identifier.ours;
         bench::require(text == identifier.text, "the identifier was written as another one");
     }
-    std::vector<Peer> peers;
+    std::vector<Peer> peers = {bench::peer("Qt", bench::qtFormat(identifiers.texts()))};
 #ifdef KORU_BENCH_HAS_LIBUUID
     peers.push_back(bench::peer("libuuid", Work::repeated([identifiers]() mutable {
                                     char text[37];
@@ -140,7 +148,7 @@ void _format(bench::Report& report, Identifiers identifiers) {
                        std::string text = identifiers.next().ours;
                        return text;
                    }),
-                   peers, 1.05);
+                   peers, 0.8);
 }
 
 void _stream(bench::Report& report, Identifiers identifiers) {
@@ -206,7 +214,7 @@ void _compare(bench::Report& report, Identifiers const& identifiers) {
 
 int main(int argc, char** argv) {
     Identifiers const identifiers;
-    bench::Report report("Koru identifier", bench::Options(argc, argv));
+    bench::Report report("identifiers", bench::Options(argc, argv));
     _parse(report, identifiers);
     _format(report, identifiers);
     _stream(report, identifiers);
