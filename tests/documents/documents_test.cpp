@@ -17,6 +17,7 @@
 #include <string>
 #include <thread>
 #include <type_traits>
+#include <vector>
 
 #include <koru/dynamiclibrary.h>
 #include <koru/file.h>
@@ -76,6 +77,46 @@ TEST_CASE("parentheses around a path of a variable declare a function, braces ma
     static_assert(std::is_same<decltype(braces), InitializationFile>::value, "");
     bool const same = braces.getName() == name && text.getName() == name;
     CHECK(same);
+}
+
+// ------------------------------------------------------------------------------------ odd lines
+
+TEST_CASE("a header of brackets alone keeps those that one trim at each end leaves") {
+    struct Row {
+        char const* header;
+        std::wstring section;
+    };
+    TempDir const directory;
+    std::string const path = directory / "app.ini";
+    for (Row const& row : {Row{"[]", L"["}, Row{"[]]", L"["}, Row{"[[]]", L"[["}, Row{"[[", L"[["},
+                           Row{"[][", L"]["}, Row{"[]x", L"]x"}, Row{"[x[]", L"x["}}) {
+        CAPTURE(row.header);
+        writeFile(path, std::string(row.header) + "\nk=v\n");
+        InitializationFile file(path);
+        file.open(Koru::File::READ);
+        bool const named = file.enumerateSections() == std::vector<std::wstring>{row.section};
+        CHECK(named);
+    }
+}
+
+TEST_CASE("a NUL in a line is text, up to which names and values count") {
+    using namespace std::string_literals;
+    TempDir const directory;
+    std::string const path = directory / "app.ini";
+    writeFile(path, "[s\0]]\na\0b=1\nc=2 \0 \n\0d=3\ne\0#=4\n[\0t]\nf=5\n"s);
+    InitializationFile sections(path);
+    sections.open(Koru::File::READ);
+    using Texts = std::vector<std::wstring>;
+    bool const headers = sections.enumerateSections() == Texts{L"s"};
+    bool const keys = sections.enumerateKeys(L"s") == Texts{L"a", L"c", L"e"};
+    CHECK(headers);
+    CHECK(keys);
+    Koru::PropertyFile properties(path);
+    properties.open(Koru::File::READ);
+    bool const flat = properties.enumerateKeys() == Texts{L"a", L"c", L"e", L"f"};
+    bool const blank = properties.getValue(L"c") == L"2 ";
+    CHECK(flat);
+    CHECK(blank);
 }
 
 // ----------------------------------------------------------- an exception, a child, a dead thread
