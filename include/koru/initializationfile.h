@@ -72,8 +72,8 @@ public:
     /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
     ///         written, the table intact
     /// @throws std::runtime_error "failed to open file."; the mode is 0 then and the table intact:
-    ///         `setMode` and another `close` try again. The file is gone; or as it was, if it could
-    ///         not be deleted either; or the new one, if it could be written without a stream.
+    ///         `setMode` and another `close` try again. The file is gone or empty; or as it was, if
+    ///         neither was possible; or the new one, if it could be written without a stream.
     /// @throws std::runtime_error "failed to close file."
     void close() override;
 
