@@ -68,10 +68,9 @@ void _absolute(bench::Report& report) {
 /// The limit is what it costs to ask both for their directory and name, and to compare those
 /// copies.
 void _equal(bench::Report& report) {
-    std::pair<std::wstring, std::wstring> const text(L"usr/share/application/settings",
-                                                     L"main.ini");
-    auto const same = text;
-    Koru::File::Path const a(L"/" + text.first + L"/" + text.second);
+    std::wstring const directory = L"usr/share/application/settings";
+    std::wstring const name = L"main.ini";
+    Koru::File::Path const a(L"/" + directory + L"/" + name);
     Koru::File::Path const b(a);
     auto const ours = [&] {
         bench::keep(a);
@@ -79,8 +78,8 @@ void _equal(bench::Report& report) {
         return a == b;
     };
     auto const copies = [&] {
-        auto const left = text;
-        auto const right = same;
+        auto const left = std::make_pair(directory, name);
+        auto const right = std::make_pair(directory, name);
         bench::keep(left);
         bench::keep(right);
         return left == right;
