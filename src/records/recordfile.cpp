@@ -23,6 +23,21 @@ constexpr std::size_t BLOCK = 64 * 1024; // bytes
 constexpr std::size_t LENGTH_SIZE = 4;
 constexpr std::uint64_t LONGEST = std::numeric_limits<std::uint32_t>::max();
 
+std::size_t _decodeLength(char const* bytes) {
+    auto const byte = [bytes](std::size_t i) {
+        return std::size_t{static_cast<unsigned char>(bytes[i])} << (8 * i);
+    };
+    return byte(0) | byte(1) | byte(2) | byte(3);
+}
+
+void _encodeLength(std::size_t length, char* to) {
+    auto const byte = [length](std::size_t i) { return static_cast<char>(length >> (8 * i)); };
+    to[0] = byte(0);
+    to[1] = byte(1);
+    to[2] = byte(2);
+    to[3] = byte(3);
+}
+
 /// The second byte of each pair, sign-extended. Intended: also where that is a character beyond
 /// 0x7FFFFFFF.
 void _decodeKey(char const* pairs, std::size_t size, wchar_t* to) {
@@ -101,16 +116,10 @@ private:
     }
 
     std::size_t readLength() {
+        if (char const* const bytes = take(LENGTH_SIZE)) return _decodeLength(bytes);
         std::array<char, LENGTH_SIZE> bytes;
-        if (char const* const taken = take(LENGTH_SIZE))
-            std::memcpy(bytes.data(), taken, LENGTH_SIZE);
-        else
-            read(bytes.data(), LENGTH_SIZE);
-        std::uint32_t length = 0;
-        for (std::size_t i = 0; i < bytes.size(); ++i) {
-            length |= std::uint32_t{static_cast<unsigned char>(bytes[i])} << (8 * i);
-        }
-        return length;
+        read(bytes.data(), bytes.size());
+        return _decodeLength(bytes.data());
     }
 
     /// Reads as many bytes as a length says, which is only believed as far as bytes arrive: memory
@@ -196,10 +205,7 @@ private:
 
     void writeLength(std::size_t length) {
         room(LENGTH_SIZE);
-        char* const to = block_ + filled_;
-        for (std::size_t i = 0; i < LENGTH_SIZE; ++i) {
-            to[i] = static_cast<char>((length >> (8 * i)) & 0xFF);
-        }
+        _encodeLength(length, block_ + filled_);
         filled_ += LENGTH_SIZE;
     }
 
