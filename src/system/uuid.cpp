@@ -17,10 +17,6 @@ constexpr std::size_t TEXT_SIZE = 36;
 
 using Text = std::array<char, TEXT_SIZE>;
 
-/// Where the digits stand in the text form, four by four; before the third to the sixth of these
-/// there is a hyphen.
-constexpr std::array<std::size_t, 8> PLACES = {0, 4, 9, 14, 19, 24, 28, 32};
-
 /// The digits of sixteen values from 0 to 15.
 __m128i _toDigits(__m128i values) {
     __m128i const letters = _mm_cmpgt_epi8(values, _mm_set1_epi8(9));
@@ -37,9 +33,11 @@ Text _format(unsigned char const (&bytes)[16]) {
     store16(digits.data() + 16, _toDigits(_mm_unpackhi_epi8(high, low)));
     Text text;
     text.fill('-');
-    for (std::size_t i = 0; i < PLACES.size(); ++i) {
-        std::memcpy(text.data() + PLACES[i], digits.data() + 4 * i, 4);
-    }
+    std::memcpy(&text[0], &digits[0], 8);
+    std::memcpy(&text[9], &digits[8], 4);
+    std::memcpy(&text[14], &digits[12], 4);
+    std::memcpy(&text[19], &digits[16], 4);
+    std::memcpy(&text[24], &digits[20], 12);
     return text;
 }
 
@@ -64,13 +62,13 @@ bool _read(__m128i c, unsigned char* to) {
 /// Reads the text form.
 bool _readUsual(char const* text, unsigned char* to) {
     if (text[8] != '-' || text[13] != '-' || text[18] != '-' || text[23] != '-') return false;
-    auto const four = [text](std::size_t i) {
+    auto const four = [text](std::size_t place) {
         int digits;
-        std::memcpy(&digits, text + PLACES[i], sizeof digits);
+        std::memcpy(&digits, text + place, sizeof digits);
         return digits;
     };
-    return _read(_mm_setr_epi32(four(0), four(1), four(2), four(3)), to) &&
-           _read(_mm_setr_epi32(four(4), four(5), four(6), four(7)), to + 8);
+    return _read(_mm_setr_epi32(four(0), four(4), four(9), four(14)), to) &&
+           _read(_mm_setr_epi32(four(19), four(24), four(28), four(32)), to + 8);
 }
 
 /// Reads text with hyphens anywhere. Intended: what they leave free at the end keeps what stood
