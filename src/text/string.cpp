@@ -82,10 +82,13 @@ std::size_t _commonPrefix(wchar_t const* a, wchar_t const* b, std::size_t size) 
 } // namespace
 
 int compare(std::wstring const& a, std::wstring const& b) {
-    // Most names differ at once.
-    wchar_t const x = a.c_str()[0];
-    wchar_t const y = b.c_str()[0];
-    if (x != y && lower(x) != lower(y)) return static_cast<int>(lower(x) - lower(y));
+    // Most names differ at their start, before vectors are worth their while.
+    wchar_t const* x = a.c_str();
+    wchar_t const* y = b.c_str();
+    for (wchar_t const* const few = x + 2; *x == *y && x != few; ++x, ++y) {
+        if (*x == 0) return 0;
+    }
+    if (*x != *y && lower(*x) != lower(*y)) return static_cast<int>(lower(*x) - lower(*y));
     std::size_t const common = _commonPrefix(a.data(), b.data(), std::min(a.size(), b.size()));
     return compareFolded(WideCursor(a.c_str() + common), WideCursor(b.c_str() + common));
 }
