@@ -355,9 +355,10 @@ TEST_CASE_TEMPLATE("a thread cancelled in synchronize or close leaves the old co
                 file->open(READ_WRITE);
                 Family::add(*file, COUNT);
                 cancelled = cancelledAt(point, [&] {
-                    std::unique_ptr<typename Family::File> own;
-                    if (!outlives) own = std::move(file);
-                    step(outlives ? *file : *own);
+                    typename Family::File& target = *file;
+                    std::unique_ptr<typename Family::File> const own(outlives ? nullptr
+                                                                              : file.release());
+                    step(target);
                     ::pthread_testcancel();
                 });
                 file.reset();

@@ -153,7 +153,8 @@ extern "C" int ioctl(int fd, unsigned long request, ...) noexcept {
 }
 
 #if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
-extern "C" void* __libc_malloc(size_t size); // NOLINT(bugprone-reserved-identifier)
+// NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming)
+extern "C" void* __libc_malloc(size_t size);
 
 extern "C" void* malloc(size_t size) noexcept {
     if (!test::opensStream) return __libc_malloc(size);
