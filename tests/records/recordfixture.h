@@ -111,7 +111,7 @@ inline std::string cutField(std::string& rest) {
     if (rest.size() < 4) throw std::runtime_error("failed to read from file");
     std::uint32_t length = 0;
     for (std::size_t i = 4; i-- > 0;) length = length << 8 | static_cast<unsigned char>(rest[i]);
-    if (length > static_cast<std::size_t>(PTRDIFF_MAX)) throw std::bad_alloc();
+    if (length > Bytes().max_size()) throw std::bad_alloc();
     if (rest.size() - 4 < length) throw std::runtime_error("failed to read from file");
     std::string const field = rest.substr(4, length);
     rest.erase(0, 4 + std::size_t{length});
