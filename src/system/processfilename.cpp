@@ -11,6 +11,8 @@
 
 #include <koru/string.h>
 
+#include "concurrency/cancellation.h"
+
 namespace Koru {
 
 namespace {
@@ -23,15 +25,11 @@ static_assert(BUFFER_SIZE >= PATH_MAX, "realpath needs room for PATH_MAX bytes")
 /// behind, or end the process where the close is part of a destructor.
 class CommandLine {
 public:
-    CommandLine() {
-        ::pthread_setcancelstate(PTHREAD_CANCEL_DISABLE, &before_);
-        descriptor_ = ::open("/proc/self/cmdline", O_RDONLY | O_CLOEXEC);
-    }
+    CommandLine() : descriptor_(::open("/proc/self/cmdline", O_RDONLY | O_CLOEXEC)) {}
     CommandLine(CommandLine const&) = delete;
     CommandLine& operator=(CommandLine const&) = delete;
     ~CommandLine() {
         if (descriptor_ >= 0) ::close(descriptor_);
-        ::pthread_setcancelstate(before_, nullptr);
     }
 
     /// Fills the buffer up to a zero byte at least and returns how much of it that took.
@@ -50,8 +48,8 @@ public:
     }
 
 private:
-    int before_ = PTHREAD_CANCEL_ENABLE;
-    int descriptor_ = -1;
+    CancellationOff const cancellationOff_; // first: from before the open until after the close
+    int descriptor_;
 };
 
 /// Reads argv[0]. The arguments are separated by zero bytes, so as a string the buffer ends with
