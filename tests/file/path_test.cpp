@@ -92,9 +92,33 @@ std::wstring fromHex(std::string const& hex) {
     return text;
 }
 
+bool filesAreRefused = false;
+
+/// While it lives no file can be opened, if that is asked for, so nothing says where the executable
+/// is. (The sanitizers open some themselves, so it ends before anything else is done.)
+class Refusal {
+public:
+    Refusal() {
+        ::getrlimit(RLIMIT_NOFILE, &before_);
+        rlimit const none{0, before_.rlim_max};
+        if (filesAreRefused) ::setrlimit(RLIMIT_NOFILE, &none);
+    }
+    Refusal(Refusal const&) = delete;
+    Refusal& operator=(Refusal const&) = delete;
+    ~Refusal() { ::setrlimit(RLIMIT_NOFILE, &before_); }
+
+private:
+    rlimit before_{};
+};
+
+File::Path parsed(std::wstring const& text) {
+    Refusal const refusal;
+    return File::Path(text);
+}
+
 void answerWith(std::wstring const& text) {
     try {
-        File::Path const path(text);
+        File::Path const path = parsed(text);
         test::answer(directoryOf(path));
         test::answer(nameOf(path));
     } catch (std::invalid_argument const& e) {
@@ -103,18 +127,13 @@ void answerWith(std::wstring const& text) {
     }
 }
 
-/// From now on no file can be opened, so nothing says where the executable is.
-bool refuseFiles() {
-    rlimit const none{0, 0};
-    return ::setrlimit(RLIMIT_NOFILE, &none) == 0;
-}
-
 /// Changes the process as an argument in capitals says. False when that fails.
 bool follow(std::string const& argument) {
     std::string const operand = argument.substr(argument.find('=') + 1);
     if (argument.compare(0, 6, "CHDIR=") == 0) return ::chdir(operand.c_str()) == 0;
     if (argument.compare(0, 6, "RMDIR=") == 0) return ::rmdir(operand.c_str()) == 0;
-    return argument == "WITHOUT_FILES" && refuseFiles();
+    filesAreRefused = argument == "WITHOUT_FILES";
+    return filesAreRefused;
 }
 
 /// Parses each argument and answers with directory and name, or follows it.
