@@ -18,7 +18,7 @@ constexpr std::size_t FIRST_CAPACITY = 64; // records
 constexpr Fingerprint HANDED_OUT = 0xFFFF;
 
 Fingerprint _fingerprint(std::wstring const& key) {
-    Fingerprint const number = toFingerprint(mixFingerprint(0, WideCursor(key.c_str())));
+    Fingerprint const number = toFingerprint(mixFingerprint(0, key.data(), key.size()));
     return number == HANDED_OUT ? Fingerprint{HANDED_OUT - 1} : number;
 }
 

@@ -72,29 +72,39 @@ std::vector<std::uint32_t> SettingsTable::sectionRanks() const {
 }
 
 std::size_t SettingsTable::find(std::wstring const& section, std::wstring const& key) {
-    completeFingerprints();
-    Fingerprint const wanted = toFingerprint(fingerprint(fingerprint(0, section), key));
-    auto const next = [this, wanted](std::size_t from) {
-        return findFingerprint(fingerprints_, wanted, from);
-    };
     SectionMatcher matches(*this, section);
-    for (std::size_t i = next(0); i != NOT_FOUND; i = next(i + 1)) {
-        if (matches(entries_[i]) && compare(entries_[i].key, key) == 0) return i;
+    auto const isAt = [this, &matches, &key](std::size_t i) {
+        return matches(entries_[i]) && areEqual(entries_[i].key, key);
+    };
+    constexpr std::size_t few = 4; // So many are compared sooner than the column is made.
+    if (entries_.size() > few && entries_.size() != fingerprints_.size()) completeFingerprints();
+    if (!fingerprints_.empty()) {
+        Fingerprint const wanted = toFingerprint(mixFingerprint(mixFingerprint(0, section), key));
+        std::size_t i = findFingerprint(fingerprints_, wanted, 0);
+        while (i != NOT_FOUND && !isAt(i)) i = findFingerprint(fingerprints_, wanted, i + 1);
+        if (i != NOT_FOUND) return i;
+    }
+    // What the column does not cover is compared entry by entry.
+    for (std::size_t i = fingerprints_.size(); i != entries_.size(); ++i) {
+        if (isAt(i)) return i;
     }
     return NOT_FOUND;
 }
 
-void SettingsTable::completeFingerprints() {
-    sectionFingerprints_.reserve(sections_.size());
-    while (sectionFingerprints_.size() < sections_.size()) {
-        sectionFingerprints_.push_back(fingerprint(0, sections_[sectionFingerprints_.size()]));
+void SettingsTable::completeFingerprints() noexcept {
+    std::size_t const known = fingerprints_.size();
+    try {
+        for (std::size_t i = sectionFingerprints_.size(); i != sections_.size(); ++i) {
+            sectionFingerprints_.push_back(mixFingerprint(0, sections_[i]));
+        }
+        fingerprints_.resize(entries_.size());
+    } catch (std::bad_alloc const&) { // Look-ups do without.
+        return;
     }
-    if (fingerprints_.size() == entries_.size()) return;
-    fingerprints_.reserve(entries_.capacity());
-    while (fingerprints_.size() < entries_.size()) {
-        Entry const& entry = entries_[fingerprints_.size()];
-        fingerprints_.push_back(
-            toFingerprint(fingerprint(sectionFingerprints_[entry.section], entry.key)));
+    for (std::size_t i = known; i != entries_.size(); ++i) {
+        Entry const& entry = entries_[i];
+        fingerprints_[i] =
+            toFingerprint(mixFingerprint(sectionFingerprints_[entry.section], entry.key));
     }
 }
 
@@ -140,7 +150,7 @@ void SettingsTable::remove(std::wstring const& section, std::wstring const& key)
     auto const offset = static_cast<std::ptrdiff_t>(index);
     release(entries_[index]);
     entries_.erase(entries_.begin() + offset);
-    fingerprints_.erase(fingerprints_.begin() + offset); // complete after find
+    if (index < fingerprints_.size()) fingerprints_.erase(fingerprints_.begin() + offset);
 }
 
 void SettingsTable::removeEveryOther(std::wstring const& section) {

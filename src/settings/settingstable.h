@@ -109,7 +109,7 @@ private:
     std::uint32_t sectionFor(std::wstring const& name);
     void dropUnusedSections();
     std::vector<std::uint32_t> sectionRanks() const;
-    void completeFingerprints();
+    void completeFingerprints() noexcept;
 
     std::vector<Entry> entries_;
     std::vector<StoredText> sections_;
@@ -118,7 +118,8 @@ private:
     std::deque<std::wstring> strings_; // what wide texts refer to
     std::vector<std::wstring*> spare_; // those of them that no text refers to any more
 
-    // Each covers as much of the entries and section names as the last look-up saw.
+    // Each covers the first ones of the entries and section names, as many as a look-up saw and had
+    // memory for.
     std::vector<Fingerprint> fingerprints_;
     std::vector<std::uint32_t> sectionFingerprints_;
 };
@@ -131,7 +132,7 @@ public:
     bool operator()(Entry const& entry) {
         if (entry.section != last_) {
             last_ = entry.section;
-            matches_ = compare(table_.sectionOf(entry), name_) == 0;
+            matches_ = areEqual(table_.sectionOf(entry), name_);
         }
         return matches_;
     }

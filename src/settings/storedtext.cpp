@@ -7,81 +7,95 @@
 #include <cstdint>
 #include <cstring>
 
-#include "text/fingerprint.h"
+#include <koru/string.h>
+
+#include "text/narrow.h"
 
 namespace Koru {
 
+std::wstring StoredText::str() const {
+    constexpr std::size_t few = 64; // Widening more of them at a time is worthwhile beyond it.
+    if (isWide()) return wideString(wide_->data(), wide_->size());
+    if (size_ <= few && isPlain(bytes())) return std::wstring(bytes_, bytes_ + size_);
+    return make_wstring(bytes_, size_);
+}
+
 namespace {
 
-/// How many bytes two texts have in common at their start, in whole characters.
-std::size_t _commonPrefix(std::string_view a, std::string_view b) {
-    std::size_t const most = std::min(a.size(), b.size());
+/// The first byte at which two texts differ, or the size of the shorter one.
+std::size_t _difference(std::string_view a, std::string_view b) {
+    std::size_t const size = std::min(a.size(), b.size());
     std::size_t i = 0;
-    for (; most - i >= sizeof(std::uint32_t); i += sizeof(std::uint32_t)) {
+    for (; size - i >= 16; i += 16) {
+        std::uint32_t const same =
+            highBits(_mm_cmpeq_epi8(load16(a.data() + i), load16(b.data() + i)));
+        if (same != ALL_BYTES) return i + static_cast<std::size_t>(__builtin_ctz(~same));
+    }
+    for (; size - i >= 4; i += 4) {
         std::uint32_t x;
         std::uint32_t y;
         std::memcpy(&x, a.data() + i, sizeof x);
         std::memcpy(&y, b.data() + i, sizeof y);
-        if (x != y) break;
+        if (x != y) return i + static_cast<std::size_t>(__builtin_ctz(x ^ y)) / 8;
     }
-    while (i != most && a[i] == b[i]) ++i;
-    auto const startsInside = [&i](std::string_view text) {
-        return i != text.size() && (text[i] & 0xC0) == 0x80;
-    };
-    while (i != 0 && (startsInside(a) || startsInside(b))) --i;
+    while (i != size && a[i] == b[i]) ++i;
     return i;
 }
 
-/// Whether towlower leaves a character of ASCII as it is, in every locale.
-bool _isItsOwnLower(char c) { return c > 0 && (c < 'A' || c > 'Z'); }
+/// Whether every locale lowers a character as ASCII has it.
+bool _isUndisputed(char c) { return c > 0 && c != 'I'; }
 
-} // namespace
-
-int compare(StoredText const& a, StoredText const& b) {
-    if (a.wide() == nullptr && b.wide() == nullptr) {
-        std::size_t const common = _commonPrefix(a.bytes(), b.bytes());
-        // Mostly the two characters behind it decide.
-        if (common < std::min(a.bytes().size(), b.bytes().size())) {
-            char const x = a.bytes()[common];
-            char const y = b.bytes()[common];
-            if (_isItsOwnLower(x) && _isItsOwnLower(y)) return x - y;
-        }
-        return compareFolded(BytesCursor(a.bytes().substr(common)),
-                             BytesCursor(b.bytes().substr(common)));
-    }
+/// All else. Apart, so that what mostly decides does without what this takes.
+__attribute__((noinline)) int _compareFolded(StoredText const& a, StoredText const& b) {
     return a.withCursor(
         [&b](auto x) { return b.withCursor([&x](auto y) { return compareFolded(x, y); }); });
 }
 
-int compare(StoredText const& a, std::wstring const& b) {
-    WideCursor const y(b.c_str());
-    return a.withCursor([&y](auto x) { return compareFolded(x, y); });
+} // namespace
+
+int compare(StoredText const& a, StoredText const& b) {
+    if (a.isWide() || b.isWide()) return _compareFolded(a, b);
+    std::string_view const x = a.bytes();
+    std::string_view const y = b.bytes();
+    std::size_t const i = _difference(x, y);
+    if (i == y.size()) return i == x.size() ? 0 : 1;
+    if (i == x.size()) return -1;
+    // Mostly the first two characters that differ decide.
+    bool const decided = _isUndisputed(x[i]) && _isUndisputed(y[i]) && lower(x[i]) != lower(y[i]);
+    return decided ? static_cast<int>(lower(x[i]) - lower(y[i])) : _compareFolded(a, b);
 }
 
 namespace {
 
-bool _isPlain16(char const* bytes) {
-    __m128i const block = _mm_loadu_si128(reinterpret_cast<__m128i const*>(bytes));
-    // Signed, the plain bytes are those above zero.
-    return _mm_movemask_epi8(_mm_cmpgt_epi8(block, _mm_setzero_si128())) == 0xFFFF;
+/// Whether two texts of the same size are the same and ASCII.
+bool _areSame(char const* a, wchar_t const* b, std::size_t size) {
+    auto const same = [](__m128i x, __m128i y) {
+        return areAscii(x) && highBits(_mm_cmpeq_epi8(x, y)) == ALL_BYTES;
+    };
+    if (size == 0) return true;
+    if (size <= 16) return same(narrowAll(a, size), narrowAll(b, size));
+    for (std::size_t i = 0; i < size - 16; i += 16) {
+        if (!same(narrow16(a + i), narrow16(b + i))) return false;
+    }
+    return same(narrow16(a + size - 16), narrow16(b + size - 16));
+}
+
+__attribute__((noinline)) bool _areEqualFolded(StoredText const& a, std::wstring const& b) {
+    if (std::wstring const* const wide = a.wide()) return compare(*wide, b) == 0;
+    return compareFolded(BytesCursor(a.bytes()), WideCursor(b.c_str())) == 0;
 }
 
 } // namespace
 
-bool isPlain(std::string_view bytes) {
-    char const* at = bytes.data();
-    char const* const end = at + bytes.size();
-    if (bytes.size() < 16) {
-        for (; at != end; ++at) {
-            if (static_cast<signed char>(*at) <= 0) return false;
-        }
+bool areEqual(StoredText const& a, std::wstring const& b) {
+    // Mostly a name is looked for as it is written.
+    if (!a.isWide() && a.bytes().size() == b.size() &&
+        _areSame(a.bytes().data(), b.data(), b.size()))
         return true;
-    }
-    for (; end - at > 16; at += 16) {
-        if (!_isPlain16(at)) return false;
-    }
-    return _isPlain16(end - 16); // overlaps what was looked at already
+    return _areEqualFolded(a, b);
 }
+
+bool isPlain(std::string_view bytes) { return isAscii(bytes.data(), bytes.size()); }
 
 bool isCanonical(std::string_view bytes) {
     static constexpr std::array<wchar_t, 5> leastOfSize = {0, 0x01, 0x80, 0x800, 0x10000};
@@ -98,14 +112,6 @@ bool isCanonical(std::string_view bytes) {
         at += c.size;
     }
     return true;
-}
-
-std::uint32_t fingerprint(std::uint32_t before, StoredText const& text) {
-    return text.withCursor([before](auto cursor) { return mixFingerprint(before, cursor); });
-}
-
-std::uint32_t fingerprint(std::uint32_t before, std::wstring const& text) {
-    return mixFingerprint(before, WideCursor(text.c_str()));
 }
 
 } // namespace Koru

@@ -13,6 +13,7 @@
 #include <string_view>
 
 #include "text/convert.h"
+#include "text/fingerprint.h"
 #include "text/fold.h"
 
 namespace Koru {
@@ -28,16 +29,18 @@ public:
     /// A wide string of any content.
     explicit StoredText(std::wstring* wide) : wide_(wide), size_(WIDE) {}
 
-    bool empty() const { return size_ == WIDE ? wide_->empty() : size_ == 0; }
+    bool isWide() const { return size_ == WIDE; }
+
+    bool empty() const { return isWide() ? wide_->empty() : size_ == 0; }
 
     /// The wide string, or null where the text is bytes.
-    std::wstring* wide() const { return size_ == WIDE ? wide_ : nullptr; }
+    std::wstring* wide() const { return isWide() ? wide_ : nullptr; }
 
     /// The bytes of a text that is not wide.
     std::string_view bytes() const { return std::string_view(bytes_, size_); }
 
     /// The text as a string, all characters of a wide one included.
-    std::wstring str() const { return size_ == WIDE ? *wide_ : make_wstring(bytes_, size_); }
+    std::wstring str() const;
 
     /// Calls `use` with a cursor over the characters.
     template <class Use>
@@ -74,13 +77,15 @@ private:
 
 template <class Use>
 auto StoredText::withCursor(Use use) const {
-    if (size_ == WIDE) return use(WideCursor(wide_->c_str()));
+    if (isWide()) return use(WideCursor(wide_->c_str()));
     return use(BytesCursor(bytes()));
 }
 
 /// Compares as `compare` does with the wide strings.
 int compare(StoredText const& a, StoredText const& b);
-int compare(StoredText const& a, std::wstring const& b);
+
+/// Whether `compare` finds them equal.
+bool areEqual(StoredText const& a, std::wstring const& b);
 
 /// Whether the bytes are ASCII without a NUL.
 bool isPlain(std::string_view bytes);
@@ -90,8 +95,13 @@ bool isPlain(std::string_view bytes);
 bool isCanonical(std::string_view bytes);
 
 /// Mixes the text into the number of the text before it, see text/fingerprint.h.
-std::uint32_t fingerprint(std::uint32_t before, StoredText const& text);
-std::uint32_t fingerprint(std::uint32_t before, std::wstring const& text);
+inline std::uint32_t mixFingerprint(std::uint32_t before, std::wstring const& text) {
+    return mixFingerprint(before, text.data(), text.size());
+}
+inline std::uint32_t mixFingerprint(std::uint32_t before, StoredText const& text) {
+    if (std::wstring const* const wide = text.wide()) return mixFingerprint(before, *wide);
+    return mixFingerprint(before, text.bytes().data(), text.bytes().size());
+}
 
 } // namespace Koru
 

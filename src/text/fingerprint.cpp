@@ -3,26 +3,31 @@
 #include <emmintrin.h>
 
 #include <algorithm>
+#include <array>
+
+#include "text/narrow.h"
 
 namespace Koru {
 
 namespace {
 
-/// Looks at 32 numbers a step. `equal` tells which of eight numbers are looked for, `matches`
+/// Looks at 64 numbers a step. `equal` tells which of eight numbers are looked for, `matches`
 /// whether one is.
 template <class Equal, class Matches>
 std::size_t _find(std::vector<Fingerprint> const& column, std::size_t from, Equal equal,
                   Matches matches) {
     Fingerprint const* const numbers = column.data();
     std::size_t const size = column.size();
-    auto const eight = [numbers, equal](std::size_t at) {
-        return equal(_mm_loadu_si128(reinterpret_cast<__m128i const*>(numbers + at)));
-    };
+    auto const in8 = [numbers, equal](std::size_t at) { return equal(load16(numbers + at)); };
+    auto const in16 = [in8](std::size_t at) { return _mm_or_si128(in8(at), in8(at + 8)); };
+    auto const in32 = [in16](std::size_t at) { return _mm_or_si128(in16(at), in16(at + 16)); };
     std::size_t i = from;
-    for (; size - i >= 32; i += 32) {
-        __m128i const any = _mm_or_si128(_mm_or_si128(eight(i), eight(i + 8)),
-                                         _mm_or_si128(eight(i + 16), eight(i + 24)));
-        if (_mm_movemask_epi8(any) != 0) break;
+    for (; size - i >= 64; i += 64) {
+        if (highBits(_mm_or_si128(in32(i), in32(i + 32))) != 0) break;
+    }
+    for (; size - i >= 8; i += 8) {
+        std::uint32_t const found = highBits(in8(i));
+        if (found != 0) return i + static_cast<std::size_t>(__builtin_ctz(found)) / sizeof *numbers;
     }
     auto const* const found = std::find_if(numbers + i, numbers + size, matches);
     return found == numbers + size ? NOT_FOUND : static_cast<std::size_t>(found - numbers);
@@ -50,6 +55,111 @@ std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint 
             return _mm_or_si128(_mm_cmpeq_epi16(numbers, a), _mm_cmpeq_epi16(numbers, b));
         },
         [wanted, orThis](Fingerprint number) { return number == wanted || number == orThis; });
+}
+
+namespace {
+
+/// How many characters of a name count. That names which differ only behind them have one number
+/// costs comparisons, no more.
+constexpr std::size_t MOST = 256;
+
+/// `classOf` for sixteen characters of ASCII.
+__m128i _classesOf(__m128i characters) {
+    __m128i const lower = _mm_or_si128(characters, _mm_set1_epi8(0x20));
+    __m128i const isK = _mm_cmpeq_epi8(lower, _mm_set1_epi8('k'));
+    return _mm_xor_si128(lower, _mm_and_si128(isK, _mm_set1_epi8('k' ^ 'i')));
+}
+
+/// A number from the classes of characters of ASCII, each with a weight that its place gives it.
+class Sum {
+public:
+    template <class Char>
+    Sum(Char const* name, std::size_t size) : size_(static_cast<std::uint32_t>(size)) {
+        if (size > 16)
+            addLong(name, size);
+        else if (size != 0)
+            add(narrowAll(name, size));
+    }
+
+    /// Whether all were characters of ASCII, and not NUL. The sum is good for nothing otherwise.
+    bool isExact() const { return highBits(exact_) == ALL_BYTES; }
+
+    std::uint32_t mixedInto(std::uint32_t before) const {
+        __m128i const two = _mm_add_epi32(sum_, _mm_unpackhi_epi64(sum_, sum_));
+        __m128i const one = _mm_add_epi32(two, _mm_srli_epi64(two, 32));
+        auto const sum = static_cast<std::uint32_t>(_mm_cvtsi128_si32(one));
+        // Odd numbers at random; the last one spreads what differs to the high bits.
+        std::uint32_t const mixed = before * 0x85EBCA6BU + size_ * 0xC2B2AE35U + sum;
+        return (mixed ^ mixed >> 15) * 0x9E3779B1U;
+    }
+
+private:
+    /// The last sixteen may overlap with those before.
+    template <class Char>
+    void addLong(Char const* name, std::size_t size) {
+        for (std::size_t i = 0; i < size - 16; i += 16) add(narrow16(name + i));
+        add(narrow16(name + size - 16));
+    }
+
+    void add(__m128i characters) {
+        __m128i const weights =
+            _mm_setr_epi16(0x6D2B, 0x4F6D, 0x5BD1, 0x3C6F, 0x2F0B, 0x79B9, 0x1B87, 0x5563);
+        exact_ = _mm_and_si128(exact_, _mm_cmpgt_epi8(characters, _mm_setzero_si128()));
+        sum_ = _mm_add_epi32(sum_, _mm_slli_epi32(sum_, 5)); // so that the order of blocks counts
+        sum_ = _mm_add_epi32(sum_, _mm_madd_epi16(_classesOf(characters), weights));
+    }
+
+    std::uint32_t size_;
+    __m128i exact_ = _mm_set1_epi8(-1);
+    __m128i sum_ = _mm_setzero_si128();
+};
+
+/// The characters of a name before its first NUL as characters of ASCII that count as the same.
+class AsciiClasses {
+public:
+    AsciiClasses(char const* name, std::size_t size) {
+        for (std::size_t i = 0; i != size && size_ != MOST; ++i) {
+            bool const continues = (name[i] & 0xC0) == 0x80;
+            if (!continues) add(static_cast<std::uint32_t>(name[i]));
+        }
+    }
+
+    AsciiClasses(wchar_t const* name, std::size_t size) {
+        for (std::size_t i = 0; i != size && size_ != MOST && name[i] != 0; ++i) {
+            add(static_cast<std::uint32_t>(name[i]));
+        }
+    }
+
+    Sum sum() const { return Sum(classes_.data(), size_); }
+
+private:
+    void add(std::uint32_t c) { classes_[size_++] = static_cast<char>(classOf(c)); }
+
+    std::array<char, MOST> classes_; // uninitialised from size_ on
+    std::size_t size_ = 0;
+};
+
+/// Apart, so that others do without the memory that it takes.
+template <class Char>
+__attribute__((noinline)) std::uint32_t _mixClasses(std::uint32_t before, Char const* name,
+                                                    std::size_t size) {
+    return AsciiClasses(name, size).sum().mixedInto(before);
+}
+
+template <class Char>
+std::uint32_t _mix(std::uint32_t before, Char const* name, std::size_t size) {
+    Sum const sum(name, std::min(size, MOST));
+    return sum.isExact() ? sum.mixedInto(before) : _mixClasses(before, name, size);
+}
+
+} // namespace
+
+std::uint32_t mixFingerprint(std::uint32_t before, char const* name, std::size_t size) {
+    return _mix(before, name, size);
+}
+
+std::uint32_t mixFingerprint(std::uint32_t before, wchar_t const* name, std::size_t size) {
+    return _mix(before, name, size);
 }
 
 } // namespace Koru

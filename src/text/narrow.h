@@ -1,0 +1,69 @@
+// The characters of a name in a byte each, of bytes as of wide text, several at a time.
+#ifndef KORU_TEXT_NARROW_H
+#define KORU_TEXT_NARROW_H
+
+#include <cstddef>
+#include <cstring>
+
+#include "text/simd.h"
+
+namespace Koru {
+
+/// Sixteen characters. Those of wide text that are not ASCII come out as bytes that are not above
+/// zero.
+inline __m128i narrow16(char const* s) { return load16(s); }
+inline __m128i narrow16(wchar_t const* s) {
+    __m128i const low = _mm_packs_epi32(load16(s), load16(s + 4));
+    __m128i const high = _mm_packs_epi32(load16(s + 8), load16(s + 12));
+    return _mm_packus_epi16(low, high);
+}
+
+/// Eight or four characters, lowest in the register.
+inline __m128i narrow8(char const* s) {
+    return _mm_loadl_epi64(reinterpret_cast<__m128i const*>(s));
+}
+inline __m128i narrow8(wchar_t const* s) {
+    __m128i const eight = _mm_packs_epi32(load16(s), load16(s + 4));
+    return _mm_packus_epi16(eight, eight);
+}
+inline __m128i narrow4(char const* s) {
+    int four;
+    std::memcpy(&four, s, sizeof four);
+    return _mm_cvtsi32_si128(four);
+}
+inline __m128i narrow4(wchar_t const* s) {
+    __m128i const four = _mm_packs_epi32(load16(s), load16(s));
+    return _mm_packus_epi16(four, four);
+}
+
+/// All of one to sixteen characters, at places that only their number decides, some more than once.
+template <class Char>
+__m128i narrowAll(Char const* s, std::size_t size) {
+    if (size >= 8) return _mm_unpacklo_epi64(narrow8(s), narrow8(s + size - 8));
+    if (size >= 4) {
+        __m128i const eight = _mm_unpacklo_epi32(narrow4(s), narrow4(s + size - 4));
+        return _mm_unpacklo_epi64(eight, eight);
+    }
+    __m128i const few = _mm_setr_epi32(s[0], s[size / 2], s[size - 1], s[0]);
+    __m128i const pairs = _mm_packs_epi32(few, few);
+    return _mm_packus_epi16(pairs, pairs);
+}
+
+/// Whether all bytes of a register are characters of ASCII, and not NUL.
+inline bool areAscii(__m128i bytes) {
+    return highBits(_mm_cmpgt_epi8(bytes, _mm_setzero_si128())) == ALL_BYTES;
+}
+
+/// Whether a text is ASCII without a NUL.
+template <class Char>
+bool isAscii(Char const* s, std::size_t size) {
+    if (size <= 16) return size == 0 || areAscii(narrowAll(s, size));
+    for (std::size_t i = 0; i < size - 16; i += 16) {
+        if (!areAscii(narrow16(s + i))) return false;
+    }
+    return areAscii(narrow16(s + size - 16)); // overlaps what was looked at already
+}
+
+} // namespace Koru
+
+#endif

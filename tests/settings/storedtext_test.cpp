@@ -1,0 +1,158 @@
+// Text as a settings table keeps it, bytes or wide, against the rules that hold for wide strings.
+// The sources are compiled into this program, since the library exports none of this.
+#include <doctest/doctest.h>
+
+#include <cstddef>
+#include <memory>
+#include <random>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include <koru/string.h>
+
+#include "settings/storedtext.h"
+#include "support/locales.h"
+#include "support/settingsmodel.h"
+
+namespace Koru {
+
+// What the library has for itself, the plain way.
+std::wstring make_wstring(char const* s, std::size_t size) {
+    return make_wstring(std::string(s, size));
+}
+std::wstring wideString(wchar_t const* s, std::size_t size) { return std::wstring(s, size); }
+
+} // namespace Koru
+
+using Koru::StoredText;
+using test::inEachLocale;
+
+namespace {
+
+/// One text in both forms. The bytes are in memory that ends where they end, so that a sanitizer
+/// sees what is read behind them.
+class Text {
+public:
+    explicit Text(std::wstring const& characters)
+        : string_(characters), bytes_(exactly(Koru::make_string(characters))) {}
+    Text(Text const&) = delete;
+    Text& operator=(Text const&) = delete;
+
+    std::wstring const& string() const { return string_; }
+    StoredText narrow() const { return StoredText(std::string_view(bytes_.data(), bytes_.size())); }
+    StoredText wide() { return StoredText(&string_); }
+
+private:
+    static std::vector<char> exactly(std::string const& bytes) {
+        return std::vector<char>(bytes.begin(), bytes.end());
+    }
+
+    std::wstring string_;
+    std::vector<char> bytes_;
+};
+
+int sign(int value) { return (value > 0) - (value < 0); }
+
+/// How the library's own rule orders them, character by character.
+int plainOrder(std::wstring const& a, std::wstring const& b) {
+    return sign(Koru::compare(a.c_str(), b.c_str()));
+}
+
+void checkPair(Text& a, Text& b) {
+    int const order = plainOrder(a.string(), b.string());
+    bool same = true;
+    for (StoredText const& x : {a.narrow(), a.wide()}) {
+        for (StoredText const& y : {b.narrow(), b.wide()}) same &= sign(compare(x, y)) == order;
+        same &= areEqual(x, b.string()) == (order == 0);
+    }
+    if (same) return;
+    INFO(test::shown(a.string()), " and ", test::shown(b.string()));
+    CHECK(same);
+}
+
+/// Characters that some locale folds in a way of its own, with partners and neighbours.
+std::wstring const odd =
+    L"AaIi\u0130\u0131Kk\u212AZz@[`{\x7F\u00E9\u00C9\u00DF\u03C3\u03A3\u20AC\u4E2D\U0001F600";
+
+} // namespace
+
+TEST_CASE("texts of up to two odd characters compare as wide strings do, behind any beginning") {
+    std::vector<std::wstring> names = {L""};
+    for (std::size_t i = 0; names[i].size() < 2; ++i) {
+        for (wchar_t const c : odd) names.push_back(std::wstring(names[i]) + c);
+    }
+    for (std::size_t const before : {0U, 1U, 3U, 4U, 14U, 15U, 16U, 31U}) {
+        std::vector<std::unique_ptr<Text>> texts;
+        for (std::size_t i = 0; i < names.size(); i += before % 4 == 0 ? 1 : 7) {
+            texts.push_back(std::make_unique<Text>(std::wstring(before, L'x') + names[i]));
+        }
+        inEachLocale([&texts] {
+            for (auto const& a : texts) {
+                for (auto const& b : texts) checkPair(*a, *b);
+            }
+        });
+    }
+}
+
+TEST_CASE("random texts that are alike but for case, a character or the end compare likewise") {
+    std::mt19937 random(1);
+    inEachLocale([&random] {
+        for (int i = 0; i < 20000; ++i) {
+            std::wstring a(random() % 70, L'\0');
+            bool const plain = random() % 2 == 0;
+            for (wchar_t& c : a)
+                c = plain ? static_cast<wchar_t>(' ' + random() % 95) : odd[random() % odd.size()];
+            std::wstring b = a;
+            std::size_t const one = random() % (a.size() + 1);
+            unsigned const change = random() % 4;
+            if (change == 1) b.resize(one);
+            if (change == 2 && one != a.size()) b[one] = odd[random() % odd.size()];
+            if (change == 3)
+                for (wchar_t& c : b) c = c < 0x80 && (c | 0x20) >= 'a' ? c ^ 0x20 : c;
+            Text first(a);
+            Text second(b);
+            checkPair(first, second);
+        }
+    });
+}
+
+TEST_CASE("a name that is looked for ends at its first NUL, and so does one that was set") {
+    Text const text(L"name");
+    CHECK(areEqual(text.narrow(), std::wstring(L"NAME\0more", 9)));
+    CHECK(!areEqual(text.narrow(), std::wstring(L"nam\0", 4)));
+    CHECK(!areEqual(text.narrow(), std::wstring(L"nam\0e", 5)));
+    std::wstring set(L"name\0is long", 12);
+    CHECK(areEqual(StoredText(&set), L"name"));
+    CHECK(!areEqual(StoredText(&set), L""));
+    CHECK(areEqual(StoredText(), std::wstring()));
+    CHECK(!areEqual(StoredText(), L"x"));
+    CHECK(areEqual(StoredText(), std::wstring(L"\0x", 2)));
+}
+
+TEST_CASE("text is plain unless a byte of it is NUL or beyond ASCII, at any place") {
+    for (std::size_t size = 0; size < 70; ++size) {
+        std::vector<char> bytes(size, 'p');
+        std::string_view const view(bytes.data(), size);
+        CHECK(Koru::isPlain(view));
+        for (char& c : bytes) {
+            for (int const odd : {0, 1, 0x7F, 0x80, 0xC3, 0xFF}) {
+                c = static_cast<char>(odd);
+                CHECK(Koru::isPlain(view) == (odd > 0 && odd < 0x80));
+            }
+            c = 'p';
+        }
+    }
+}
+
+TEST_CASE("text of any length is widened to what it was made of") {
+    for (std::size_t size = 0; size < 150; ++size) {
+        for (wchar_t const c : {L'a', L'\u00E9', L'\u4E2D'}) {
+            std::wstring string(size, L'a');
+            if (size > 3) string[size - 2] = c;
+            Text text(string);
+            CHECK((text.narrow().str() == string));
+            CHECK((text.wide().str() == string));
+        }
+    }
+}
