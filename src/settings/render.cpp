@@ -5,64 +5,109 @@
 #include <limits>
 #include <new>
 
+#include "text/narrow.h"
+
 namespace Koru {
 
 namespace {
 
-/// Counts the bytes that a text takes at the most.
-class Counter {
-public:
-    void put(char) { ++size_; }
-    void put(StoredText const& text) {
-        std::wstring const* const wide = text.wide();
-        size_ += wide ? encodedBound(wide->data(), wide->size()) : text.bytes().size();
+using Entry = SettingsTable::Entry;
+
+std::uint64_t _bound(StoredText const& text) {
+    std::wstring const* const wide = text.wide();
+    if (wide == nullptr) return text.bytes().size();
+    bool const ascii = isAscii(wide->data(), wide->size());
+    return ascii ? wide->size() : encodedBound(wide->data(), wide->size());
+}
+
+char* _encode(std::wstring const& text, char* to) {
+    bool const ascii = isAscii(text.data(), text.size());
+    return ascii ? narrow(text.data(), text.size(), to) : encode(text.data(), text.size(), to);
+}
+
+/// The bytes that the text takes at the most: with a header wherever there may be one, since
+/// whether two names are the same depends on the C locale, which another thread may change
+/// meanwhile.
+std::uint64_t _bound(SettingsTable const& table, Headers headers) {
+    std::uint64_t size = 0;
+    Entry const* previous = nullptr;
+    for (Entry const& entry : table.entries()) {
+        if (headers == Headers::OF_SECTIONS &&
+            (previous == nullptr || previous->section != entry.section)) {
+            size += _bound(table.sectionOf(entry)) + std::strlen("[]\n");
+        }
+        size += _bound(entry.key) + _bound(entry.value) + std::strlen("=\n");
+        previous = &entry;
     }
+    return size;
+}
 
-    std::size_t size() const {
-        if (size_ > std::numeric_limits<std::size_t>::max()) throw std::bad_alloc();
-        return static_cast<std::size_t>(size_);
-    }
-
-private:
-    std::uint64_t size_ = 0;
-};
-
-/// Writes text as make_string gives it to memory that is large enough.
+/// Writes to memory that is large enough. What follows upon each other in the bytes of the file
+/// that was read as it does in the new text, as most lines do, is copied at once.
 class Writer {
 public:
-    explicit Writer(char* to) : to_(to) {}
-    void put(char c) { *to_++ = c; }
-    void put(StoredText const& text) {
-        if (std::wstring const* const wide = text.wide()) {
-            to_ = encode(wide->data(), wide->size(), to_);
+    Writer(char* to, std::string_view file) : to_(to), fileEnd_(file.data() + file.size()) {}
+
+    void put(char c) {
+        if (runEnd_ != run_ && runEnd_ != fileEnd_ && *runEnd_ == c) {
+            ++runEnd_;
             return;
         }
-        std::string_view const bytes = text.bytes();
-        std::memcpy(to_, bytes.data(), bytes.size());
-        to_ += bytes.size();
+        finishRun();
+        *to_++ = c;
     }
 
-    char const* end() const { return to_; }
+    void put(StoredText const& text) {
+        if (std::wstring const* const wide = text.wide()) {
+            finishRun();
+            to_ = _encode(*wide, to_);
+        } else if (!text.empty()) {
+            putOfFile(text.bytes());
+        }
+    }
+
+    /// The end of what was written.
+    char const* finish() {
+        finishRun();
+        return to_;
+    }
 
 private:
+    void putOfFile(std::string_view bytes) {
+        if (bytes.data() != runEnd_) {
+            finishRun();
+            run_ = bytes.data();
+        }
+        runEnd_ = bytes.data() + bytes.size();
+    }
+
+    void finishRun() {
+        auto const size = static_cast<std::size_t>(runEnd_ - run_);
+        if (size != 0) std::memcpy(to_, run_, size);
+        to_ += size;
+        run_ = runEnd_;
+    }
+
     char* to_;
+    char const* run_ = nullptr; // bytes of the file that are still to be copied
+    char const* runEnd_ = nullptr;
+    char const* fileEnd_;
 };
 
-template <class Sink>
-void _emit(SettingsTable const& table, Headers headers, Sink& sink) {
-    SettingsTable::Entry const* previous = nullptr;
-    for (SettingsTable::Entry const& entry : table.entries()) {
+void _write(SettingsTable const& table, Headers headers, Writer& writer) {
+    Entry const* previous = nullptr;
+    for (Entry const& entry : table.entries()) {
         if (headers == Headers::OF_SECTIONS &&
             (previous == nullptr || !table.sameSection(*previous, entry))) {
-            sink.put('[');
-            sink.put(table.sectionOf(entry));
-            sink.put(']');
-            sink.put('\n');
+            writer.put('[');
+            writer.put(table.sectionOf(entry));
+            writer.put(']');
+            writer.put('\n');
         }
-        sink.put(entry.key);
-        sink.put('=');
-        sink.put(entry.value);
-        sink.put('\n');
+        writer.put(entry.key);
+        writer.put('=');
+        writer.put(entry.value);
+        writer.put('\n');
         previous = &entry;
     }
 }
@@ -70,12 +115,12 @@ void _emit(SettingsTable const& table, Headers headers, Sink& sink) {
 } // namespace
 
 RenderedText render(SettingsTable const& table, Headers headers) {
-    Counter counter;
-    _emit(table, headers, counter);
-    std::unique_ptr<char[]> bytes(new char[counter.size()]);
-    Writer writer(bytes.get());
-    _emit(table, headers, writer);
-    auto const size = static_cast<std::size_t>(writer.end() - bytes.get());
+    std::uint64_t const bound = _bound(table, headers);
+    if (bound > std::numeric_limits<std::size_t>::max()) throw std::bad_alloc();
+    std::unique_ptr<char[]> bytes(new char[static_cast<std::size_t>(bound)]);
+    Writer writer(bytes.get(), table.held());
+    _write(table, headers, writer);
+    auto const size = static_cast<std::size_t>(writer.finish() - bytes.get());
     return RenderedText(std::move(bytes), size);
 }
 

@@ -44,6 +44,9 @@ public:
     /// Takes the bytes that the texts of the entries to come are views of. The table is empty.
     FileBytes const& hold(FileBytes bytes);
 
+    /// The held bytes. All text that is kept as bytes and is not empty lies in them.
+    std::string_view held() const { return std::string_view(bytes_.data.get(), bytes_.size); }
+
     /// Makes room for about as many entries.
     void expect(std::size_t count) { entries_.reserve(count); }
 

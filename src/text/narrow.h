@@ -64,6 +64,14 @@ bool isAscii(Char const* s, std::size_t size) {
     return areAscii(narrow16(s + size - 16)); // overlaps what was looked at already
 }
 
+/// Writes such a text as bytes and returns their end.
+inline char* narrow(wchar_t const* s, std::size_t size, char* to) {
+    std::size_t i = 0;
+    for (; size - i >= 16; i += 16) store16(to + i, narrow16(s + i));
+    for (; i != size; ++i) to[i] = static_cast<char>(s[i]);
+    return to + size;
+}
+
 } // namespace Koru
 
 #endif
