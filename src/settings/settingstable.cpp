@@ -1,6 +1,7 @@
 #include "settings/settingstable.h"
 
 #include <algorithm>
+#include <exception>
 #include <new>
 #include <numeric>
 #include <utility>
@@ -20,6 +21,13 @@ void SettingsTable::clear() {
 FileBytes const& SettingsTable::hold(FileBytes bytes) {
     bytes_ = std::move(bytes);
     return bytes_;
+}
+
+void SettingsTable::expect(std::size_t count) noexcept {
+    try {
+        entries_.reserve(count);
+    } catch (std::exception const&) { // std::bad_alloc, or std::length_error where it is absurd
+    }
 }
 
 StoredText SettingsTable::keep(std::string_view bytes) {
@@ -115,7 +123,8 @@ bool SettingsTable::sameSection(Entry const& a, Entry const& b) const {
 void SettingsTable::add(std::wstring const& section, std::wstring const& key,
                         std::wstring const& value) {
     // What has to be allocated comes first, so that a failure leaves the entries as they are.
-    if (entries_.size() == entries_.capacity()) entries_.reserve(2 * entries_.size() + 8);
+    if (entries_.size() == entries_.capacity())
+        entries_.reserve(std::min(2 * entries_.size() + 8, entries_.max_size()));
     std::uint32_t const number = sectionFor(section);
     StoredText const ownKey = own(key);
     entries_.emplace_back(number, ownKey, own(value));

@@ -47,8 +47,8 @@ public:
     /// The held bytes. All text that is kept as bytes and is not empty lies in them.
     std::string_view held() const { return std::string_view(bytes_.data.get(), bytes_.size); }
 
-    /// Makes room for about as many entries.
-    void expect(std::size_t count) { entries_.reserve(count); }
+    /// Makes room for about as many entries. It is a guess: there is none where memory is short.
+    void expect(std::size_t count) noexcept;
 
     /// A text of the held bytes as make_wstring converts it: it ends at its first NUL, and what is
     /// not well-formed is kept as the characters that it decodes to.

@@ -111,3 +111,15 @@ TEST_CASE("entries are removed where the memory for look-ups came late") {
     }
     CHECK(file.enumerateKeys().empty());
 }
+
+TEST_CASE("a file of comments opens without the memory for as many entries") {
+    SettingsPlace const place;
+    std::string comments;
+    while (comments.size() < 1000000) comments += "; a comment of the usual length\n";
+    place.write(comments + "[s]\nk=v\n");
+    InitializationFile file(place.path());
+    std::size_t const guess = comments.size() / 32 * 5 * sizeof(void*);
+    withoutMemory(guess, guess + 1000, [&] { file.open(READ); });
+    CHECK(failures == 1);
+    CHECK((file.getValue(L"s", L"k") == L"v"));
+}
