@@ -147,10 +147,12 @@ void SettingsTable::setValue(std::wstring const& section, std::wstring const& ke
         return;
     }
     StoredText& stored = entries_[index].value;
-    if (std::wstring* const wide = stored.wide())
-        *wide = value;
-    else
+    if (std::wstring* const wide = stored.wide()) {
+        wide->resize(value.size());
+        std::copy(value.begin(), value.end(), wide->begin()); // without wmemcpy, see wideString
+    } else {
         stored = own(value);
+    }
 }
 
 void SettingsTable::remove(std::wstring const& section, std::wstring const& key) {
@@ -177,8 +179,9 @@ void SettingsTable::removeEveryOther(std::wstring const& section) {
 }
 
 StoredText SettingsTable::own(std::wstring const& text) {
-    if (spare_.empty()) return StoredText(&strings_.emplace_back(text));
-    *spare_.back() = text;
+    std::wstring copy = wideString(text.data(), text.size());
+    if (spare_.empty()) return StoredText(&strings_.emplace_back(std::move(copy)));
+    *spare_.back() = std::move(copy);
     StoredText const owned(spare_.back());
     spare_.pop_back();
     return owned;
