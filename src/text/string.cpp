@@ -108,16 +108,19 @@ std::wstring make_wstring(wchar_t const* s) try {
 
 std::string make_string(wchar_t const* s) { return make_string(make_wstring(s)); }
 
-std::wstring wideString(wchar_t const* s, std::size_t size) {
-    constexpr std::size_t worthwhile = 128; // Beyond it, filling the string first takes longer.
-    std::wstring result;
-    if (size > worthwhile) {
-        result.append(s, size);
-    } else {
-        result.resize(size);
-        std::copy(s, s + size, result.begin());
-    }
+namespace {
+
+std::wstring _fillAndCopy(wchar_t const* s, std::size_t size) {
+    std::wstring result(size, L'\0');
+    std::copy(s, s + size, result.begin());
     return result;
+}
+
+} // namespace
+
+std::wstring wideString(wchar_t const* s, std::size_t size) {
+    constexpr std::size_t worthwhile = 128; // Beyond it, to fill the string first takes longer.
+    return size <= worthwhile ? _fillAndCopy(s, size) : std::wstring(s, size);
 }
 
 namespace {
