@@ -4,12 +4,14 @@
 
 #include <koru/string.h>
 
+#include "text/convert.h"
+
 namespace Koru {
 
 DynamicLibrary::DynamicLibrary() : handle_(nullptr) {}
 
 DynamicLibrary::DynamicLibrary(std::wstring const& fileName)
-    : fileName_(fileName), handle_(nullptr) {}
+    : fileName_(wideString(fileName.data(), fileName.size())), handle_(nullptr) {}
 
 DynamicLibrary::DynamicLibrary(DynamicLibrary const& other)
     : fileName_(other.fileName_), handle_(nullptr) {
