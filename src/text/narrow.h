@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <cstring>
+#include <type_traits>
 
 #include "text/simd.h"
 
@@ -38,13 +39,16 @@ inline __m128i narrow4(wchar_t const* s) {
 
 /// All of one to sixteen characters, at places that only their number decides, some more than once.
 template <class Char>
-__m128i narrowAll(Char const* s, std::size_t size) {
+[[gnu::always_inline]] inline __m128i narrowAll(Char const* s, std::size_t size) {
     if (size >= 8) return _mm_unpacklo_epi64(narrow8(s), narrow8(s + size - 8));
     if (size >= 4) {
         __m128i const eight = _mm_unpacklo_epi32(narrow4(s), narrow4(s + size - 4));
         return _mm_unpacklo_epi64(eight, eight);
     }
-    __m128i const few = _mm_setr_epi32(s[0], s[size / 2], s[size - 1], s[0]);
+    auto const unit = [s](std::size_t i) {
+        return static_cast<int>(static_cast<std::make_unsigned_t<Char>>(s[i]));
+    };
+    __m128i const few = _mm_setr_epi32(unit(0), unit(size / 2), unit(size - 1), unit(0));
     __m128i const pairs = _mm_packs_epi32(few, few);
     return _mm_packus_epi16(pairs, pairs);
 }
