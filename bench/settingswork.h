@@ -102,13 +102,17 @@ public:
         clear();
         settings_ = std::make_unique<Settings>(path_);
     }
-    void load() {
-        make();
+    int load() {
         settings_->load();
+        return 0;
+    }
+    void makeAndLoad() {
+        make();
+        load();
     }
     /// Loads, and does whatever was put off until the first look-up.
-    void loadReady() {
-        load();
+    void makeReady() {
+        makeAndLoad();
         get(1);
     }
     std::size_t get(std::size_t count) { return task_->get(*settings_, count); }
@@ -116,9 +120,12 @@ public:
         task_->set(*settings_);
         return 0;
     }
+    int save() {
+        settings_->save();
+        return 0;
+    }
     std::size_t cycle() { return task_->template cycle<Settings>(path_); }
 
-    Settings& settings() { return *settings_; }
     SettingsTask<Name> const& task() const { return *task_; }
 
 private:
@@ -168,37 +175,41 @@ double unitsOf(SettingsStep step, SettingsTask<Name> const& task) {
     }
 }
 
+template <class Slot>
+Work getWork(std::shared_ptr<Slot> const& slot, SettingsStep step) {
+    auto const load = [slot] { slot->makeAndLoad(); };
+    auto const get = [slot] { return slot->get(slot->task().gets()); };
+    if (step == SettingsStep::get) return Work::prepared(load, get);
+    if (step == SettingsStep::firstGet) {
+        return Work::prepared(load, [slot] { return slot->get(1); });
+    }
+    return Work::repeated(get).within([slot] { slot->makeReady(); }, [slot] { slot->clear(); });
+}
+
+/// From a changed table to a closed file.
+template <class Slot>
+Work saveWork(std::shared_ptr<Slot> const& slot) {
+    auto const loadAndSet = [slot] {
+        slot->makeAndLoad();
+        slot->set();
+    };
+    return Work::prepared(loadAndSet, [slot] { return slot->save(); });
+}
+
 template <class Settings, class Name>
 Work settingsWork(SettingsTask<Name> const& task, SettingsStep step) {
     auto const slot = std::make_shared<SettingsSlot<Settings, Name>>(task);
-    auto const load = [slot] { slot->load(); };
-    auto const loadReady = [slot] { slot->loadReady(); };
-    auto const get = [slot] { return slot->get(slot->task().gets()); };
     switch (step) {
-    case SettingsStep::load: // from nothing to a filled table
-        return Work::prepared([slot] { slot->make(); },
-                              [slot] {
-                                  slot->settings().load();
-                                  return 0;
-                              });
+    case SettingsStep::load: // from a file to a filled table
+        return Work::prepared([slot] { slot->make(); }, [slot] { return slot->load(); });
     case SettingsStep::get:
-        return Work::prepared(load, get);
     case SettingsStep::firstGet:
-        return Work::prepared(load, [slot] { return slot->get(1); });
     case SettingsStep::warmGet:
-        return Work::repeated(get).within(loadReady, [slot] { slot->clear(); });
+        return getWork(slot, step);
     case SettingsStep::set:
-        return Work::prepared(loadReady, [slot] { return slot->set(); });
-    case SettingsStep::save: // from a changed table to a closed file
-        return Work::prepared(
-            [slot] {
-                slot->load();
-                slot->set();
-            },
-            [slot] {
-                slot->settings().save();
-                return 0;
-            });
+        return Work::prepared([slot] { slot->makeReady(); }, [slot] { return slot->set(); });
+    case SettingsStep::save:
+        return saveWork(slot);
     case SettingsStep::cycle:
         break;
     }
@@ -210,8 +221,8 @@ template <class Settings, class Ours, class Name>
 Peer settingsPeer(SettingsTask<Name> const& task, SettingsStep step) {
     SettingsSlot<Ours, Name> ours(task);
     SettingsSlot<Settings, Name> theirs(task);
-    ours.load();
-    theirs.load();
+    ours.makeAndLoad();
+    theirs.makeAndLoad();
     require(ours.get(task.gets()) == theirs.get(task.gets()), Settings::name);
     return peer(Settings::name, settingsWork<Settings>(task, step));
 }

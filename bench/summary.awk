@@ -1,5 +1,5 @@
-# Sums up the comparisons of one run or several: the medians of each, as a table if asked for, then how
-# many goals are met, and those that are missed, the worst first.
+# Sums up the comparisons of one run or several: the medians of each, as a table if asked for, then
+# how many goals are met, and those that are missed, the worst first.
 # Usage: awk -v table=0|1 -f summary.awk results.tsv
 BEGIN {
     FS = "\t"
@@ -87,7 +87,7 @@ function total(    i, j, c) {
         for (j = i - 1; j > 0 && excess(missed[j]) < excess(c); --j) missed[j + 1] = missed[j]
         missed[j + 1] = c
     }
-    printf "\n%d of %d goals met", goals - misses, goals
+    printf "\n%d of %d goals met (near ones included)", goals - misses, goals
     printf "%s\n", (misses ? "; missed, worst first:" : "")
     for (i = 1; i <= misses; ++i) {
         c = missed[i]
