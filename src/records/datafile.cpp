@@ -9,6 +9,7 @@
 #include "file/rewrite.h"
 #include "records/recordfile.h"
 #include "records/recordset.h"
+#include "text/convert.h"
 
 namespace Koru {
 
@@ -37,8 +38,7 @@ void DataFile::Record::setKey(std::wstring const& key) {
     auto const from = onlyBlanks ? key.begin() : first;
     auto const to = onlyBlanks ? key.end() : end;
     if (from == to || *from == 0) throw std::invalid_argument("zero length key");
-    key_.assign(key, static_cast<std::size_t>(from - key.begin()),
-                static_cast<std::size_t>(to - from));
+    key_ = wideString(&*from, static_cast<std::size_t>(to - from));
 }
 
 std::vector<unsigned char> const& DataFile::Record::getData() const { return data_; }
