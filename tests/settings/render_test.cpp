@@ -154,7 +154,7 @@ TEST_CASE("what stands between the entries of a file is not written with them") 
     isPair = true;
     for (int i = 0; i < 3000; ++i) {
         std::string bytes = "[s]\n";
-        for (unsigned left = random() % 12; left != 0; --left) {
+        for (auto left = random() % 12; left != 0; --left) {
             bytes += pieces[random() % pieces.size()];
         }
         SettingsPlace const place;

@@ -105,7 +105,7 @@ TEST_CASE("random texts that are alike but for case, a character or the end comp
                 c = plain ? static_cast<wchar_t>(' ' + random() % 95) : odd[random() % odd.size()];
             std::wstring b = a;
             std::size_t const one = random() % (a.size() + 1);
-            unsigned const change = random() % 4;
+            auto const change = random() % 4;
             if (change == 1) b.resize(one);
             if (change == 2 && one != a.size()) b[one] = odd[random() % odd.size()];
             if (change == 3)
@@ -136,9 +136,9 @@ TEST_CASE("text is plain unless a byte of it is NUL or beyond ASCII, at any plac
         std::string_view const view(bytes.data(), size);
         CHECK(Koru::isPlain(view));
         for (char& c : bytes) {
-            for (int const odd : {0, 1, 0x7F, 0x80, 0xC3, 0xFF}) {
-                c = static_cast<char>(odd);
-                CHECK(Koru::isPlain(view) == (odd > 0 && odd < 0x80));
+            for (int const unit : {0, 1, 0x7F, 0x80, 0xC3, 0xFF}) {
+                c = static_cast<char>(unit);
+                CHECK(Koru::isPlain(view) == (unit > 0 && unit < 0x80));
             }
             c = 'p';
         }

@@ -91,7 +91,7 @@ TEST_CASE("the number of a name is that of its classes, as bytes and wide, at an
             c = plain ? static_cast<wchar_t>(1 + random() % 0x7F) : randomCharacter(random);
             classes += static_cast<char>(classOf(static_cast<std::uint32_t>(c)));
         }
-        std::uint32_t const before = random();
+        auto const before = static_cast<std::uint32_t>(random());
         CAPTURE(name.size());
         CHECK(numberOf(name, before) == numberOf(classes, before));
         CHECK(numberOf(Koru::make_string(name), before) == numberOf(classes, before));
