@@ -116,8 +116,8 @@ bool File::rename(std::wstring const& from, std::wstring const& to) {
 bool File::remove(std::wstring const& path) {
     std::string const name = make_string(path);
     static_cast<void>(::chmod(name.c_str(), S_IRUSR | S_IWUSR));
-    static_cast<void>(std::remove(name.c_str()));
-    return !exists(path);
+    // What was removed is not there; only a failure leaves a question.
+    return std::remove(name.c_str()) == 0 || !exists(path);
 }
 
 bool File::copy(std::wstring const& from, std::wstring const& to) {

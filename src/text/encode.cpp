@@ -265,7 +265,8 @@ std::size_t _sum(__m128i values) {
 
 } // namespace
 
-std::size_t encodedBound(wchar_t const* s, std::size_t size) {
+// Not only called beside a block.
+[[gnu::force_align_arg_pointer]] std::size_t encodedBound(wchar_t const* s, std::size_t size) {
     wchar_t const* const start = s;
     wchar_t const* const end = s + size;
     __m128i further = _mm_setzero_si128();

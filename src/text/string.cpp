@@ -137,7 +137,7 @@ std::wstring _decode(char const* s, char const* end) try {
     if (s == end) return _null_wstring;
     if (_isPlainName(s, end)) return std::wstring(s, end);
     bool const shuffle = canShuffle();
-    wchar_t block[BLOCK];
+    alignas(BLOCK_ALIGNMENT) wchar_t block[BLOCK];
     wchar_t* filled = decodeBlock(s, end, block, shuffle);
     if (s == end) return wideString(block, static_cast<std::size_t>(filled - block));
     std::wstring result;
@@ -169,7 +169,7 @@ std::string make_string(std::wstring const& text) try {
     if (s == end) return _null_string;
     if (_isPlainName(s, end)) return std::string(s, end);
     bool const shuffle = canShuffle();
-    char block[BLOCK];
+    alignas(BLOCK_ALIGNMENT) char block[BLOCK];
     char* filled = encodeBlock(s, end, block, shuffle);
     if (s == end) return std::string(block, filled);
     std::string result;
@@ -185,7 +185,7 @@ std::string make_string(std::wstring const& text) try {
 
 char* encode(wchar_t const* s, std::size_t size, char* to) {
     bool const shuffle = canShuffle();
-    char block[BLOCK];
+    alignas(BLOCK_ALIGNMENT) char block[BLOCK];
     for (wchar_t const* const end = s + size; s != end;) {
         auto const bytes = static_cast<std::size_t>(encodeBlock(s, end, block, shuffle) - block);
         std::memcpy(to, block, bytes);

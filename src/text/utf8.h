@@ -12,6 +12,11 @@ namespace Koru {
 /// The units that a block has room for.
 constexpr std::size_t BLOCK = 1024;
 
+/// How a block on the stack is aligned, and with it the frame of who calls what is below: that
+/// keeps vectors on the stack and does not align it on 32 bits, where callers of the library may
+/// not have.
+constexpr std::size_t BLOCK_ALIGNMENT = 16;
+
 /// How many bytes or characters a step takes in at the most.
 constexpr std::ptrdiff_t STEP = 16;
 
