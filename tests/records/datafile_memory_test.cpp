@@ -1,14 +1,8 @@
-// The record file when memory runs out. A file of its own, since the operators that allocate memory
-// are replaced for the whole executable and the libraries it loaded.
+// The record file when memory runs out.
 #include <doctest/doctest.h>
 
-#include <unistd.h>
-
-#include <atomic>
 #include <cstddef>
-#include <cstdlib>
 #include <memory>
-#include <new>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -16,6 +10,7 @@
 #include <koru/datafile.h>
 
 #include "records/recordfixture.h"
+#include "support/failingmemory.h"
 #include "support/subprocess.h"
 #include "support/throws.h"
 
@@ -24,83 +19,19 @@ using test::checkSame;
 using test::checkSameRecords;
 using test::Entries;
 using test::Entry;
+using test::Failing;
 using test::fileBytes;
 using test::held;
 using test::isFree;
+using test::memoryRanOut;
 using test::READ;
 using test::READ_WRITE;
 using test::record;
 using test::RecordPlace;
+using test::runOutOfMemory;
+using test::Watchdog;
 using test::WRITE;
 using Record = Koru::DataFile::Record;
-
-namespace {
-
-enum class Failing { ONE, ONE_AND_ALL_LATER };
-
-std::atomic<long> allocationsBeforeFailure{-1}; // -1: none fails
-std::atomic<bool> laterOnesFail{false};
-std::atomic<long> failures{0};
-
-void* _allocate(std::size_t size) noexcept {
-    if (allocationsBeforeFailure >= 0 && allocationsBeforeFailure-- == 0) {
-        ++failures;
-        if (laterOnesFail) allocationsBeforeFailure = 0;
-        return nullptr;
-    }
-    return std::malloc(size == 0 ? 1 : size);
-}
-
-void* _allocateOrThrow(std::size_t size) {
-    void* const memory = _allocate(size);
-    if (memory == nullptr) throw std::bad_alloc();
-    return memory;
-}
-
-/// Lets allocation number `before` (from 0) fail while the callable runs, and says how that ended:
-/// "done", "std::bad_alloc" or another exception's message.
-template <class Callable>
-std::string runOutOfMemory(long before, Failing failing, Callable callable) {
-    std::string outcome = "done"; // short enough to need no memory
-    failures = 0;
-    laterOnesFail = failing == Failing::ONE_AND_ALL_LATER;
-    allocationsBeforeFailure = before;
-    try {
-        callable();
-        allocationsBeforeFailure = -1;
-    } catch (std::bad_alloc const&) {
-        allocationsBeforeFailure = -1;
-        outcome = "std::bad_alloc";
-    } catch (std::exception const& e) {
-        allocationsBeforeFailure = -1;
-        outcome = e.what();
-    }
-    return outcome;
-}
-
-bool memoryRanOut() { return failures > 0; }
-
-/// Ends the process when a test hangs.
-class Watchdog {
-public:
-    Watchdog() { ::alarm(250); }
-    Watchdog(Watchdog const&) = delete;
-    Watchdog& operator=(Watchdog const&) = delete;
-    ~Watchdog() { ::alarm(0); }
-};
-
-} // namespace
-
-void* operator new(std::size_t size) { return _allocateOrThrow(size); }
-void* operator new[](std::size_t size) { return _allocateOrThrow(size); }
-void* operator new(std::size_t size, std::nothrow_t const&) noexcept { return _allocate(size); }
-void* operator new[](std::size_t size, std::nothrow_t const&) noexcept { return _allocate(size); }
-void operator delete(void* memory) noexcept { std::free(memory); }
-void operator delete[](void* memory) noexcept { std::free(memory); }
-void operator delete(void* memory, std::size_t) noexcept { std::free(memory); }
-void operator delete[](void* memory, std::size_t) noexcept { std::free(memory); }
-void operator delete(void* memory, std::nothrow_t const&) noexcept { std::free(memory); }
-void operator delete[](void* memory, std::nothrow_t const&) noexcept { std::free(memory); }
 
 namespace {
 
