@@ -33,6 +33,7 @@
 #include <doctest/doctest.h>
 
 #include "support/cancellation.h"
+#include "support/slots.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
 #include "support/throws.h"
@@ -44,6 +45,8 @@ extern "C" char const* __tsan_default_options();
 extern "C" char const* __tsan_default_options() { return "report_mutex_bugs=0"; }
 #endif
 
+using test::slotOf;
+using test::slotOfOpen;
 namespace {
 
 /// What happens to a thread's polls for a lock: nothing, an exception, or no sleep between them.
@@ -279,24 +282,9 @@ TEST_CASE("a file is the stream, the name, the mode and the lock, in this order"
     CHECK(lock->isLocked());
 }
 
-namespace {
-
-/// The place of a virtual function in its class's table: the Itanium C++ ABI keeps, in a pointer to
-/// it, one more than the distance in bytes.
-template <class Function>
-std::size_t slotOf(Function function) {
-    std::size_t word = 0;
-    static_assert(sizeof function >= sizeof word, "a pointer to a member function");
-    std::memcpy(&word, &function, sizeof word);
-    REQUIRE(word % sizeof(void*) == 1);
-    return word / sizeof(void*);
-}
-
-} // namespace
-
 TEST_CASE("the virtual functions of a file are in the order of the published table") {
     // The destructor, which is the stream's, takes the first two places.
-    CHECK(slotOf(static_cast<void (File::*)(unsigned long)>(&File::open)) == 2);
+    CHECK(slotOfOpen<File>() == 2);
     CHECK(slotOf(static_cast<void (File::*)()>(&File::close)) == 3);
     CHECK(slotOf(&File::synchronize) == 4);
     CHECK(slotOf(&File::getMode) == 5);
@@ -305,8 +293,7 @@ TEST_CASE("the virtual functions of a file are in the order of the published tab
 
 TEST_CASE("the virtual functions of an initialization file follow those of the file") {
     using Koru::InitializationFile;
-    CHECK(slotOf(static_cast<void (InitializationFile::*)(unsigned long)>(
-              &InitializationFile::open)) == 2);
+    CHECK(slotOfOpen<InitializationFile>() == 2);
     CHECK(slotOf(static_cast<void (InitializationFile::*)()>(&InitializationFile::close)) == 3);
     CHECK(slotOf(&InitializationFile::synchronize) == 4);
     CHECK(slotOf(&InitializationFile::getMode) == 5);

@@ -25,12 +25,14 @@
 
 #include "support/relocate.h"
 #include "support/selfexec.h"
+#include "support/slots.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
 #include "support/throws.h"
 
 // The memory of this executable and the libraries it loaded comes from here, so that a test can let
 // it run out.
+using test::slotOf;
 namespace {
 
 thread_local long allocationsBeforeFailure = -1; // -1: none fails
@@ -320,21 +322,6 @@ TEST_CASE("a path is a table pointer and three wide strings: volume, directory, 
     CHECK(member(1) == &path.getDirectory());
     CHECK(member(2) == &path.getName());
 }
-
-namespace {
-
-/// The place of a virtual function in its class's table: the Itanium C++ ABI keeps, in a pointer to
-/// it, one more than the distance in bytes.
-template <class Function>
-std::size_t slotOf(Function function) {
-    std::size_t word = 0;
-    static_assert(sizeof function >= sizeof word, "a pointer to a member function");
-    std::memcpy(&word, &function, sizeof word);
-    REQUIRE(word % sizeof(void*) == 1);
-    return word / sizeof(void*);
-}
-
-} // namespace
 
 TEST_CASE("the virtual functions of a path are in the order of the published table") {
     // The destructor takes the first two places.

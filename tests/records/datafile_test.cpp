@@ -42,6 +42,7 @@
 #include <koru/datafile.h>
 
 #include "records/recordfixture.h"
+#include "support/slots.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
 #include "support/throws.h"
@@ -66,6 +67,8 @@ using test::READ;
 using test::READ_WRITE;
 using test::record;
 using test::RecordPlace;
+using test::slotOf;
+using test::slotOfOpen;
 using test::WRITE;
 using Record = Koru::DataFile::Record;
 using namespace std::string_literals;
@@ -208,24 +211,8 @@ TEST_CASE("a record is a plain value of key and data with a table of virtual ope
     CHECK(sizeof(Record) == parts);
 }
 
-namespace {
-
-/// The place of a virtual operation in the table of its class. A pointer to a virtual member is
-/// one more than the operation's distance from the table's start (Itanium C++ ABI).
-template <class Member>
-std::size_t slotOf(Member member) {
-    static_assert(sizeof(Member) == 2 * sizeof(std::size_t), "");
-    std::size_t words[2];
-    std::memcpy(words, &member, sizeof words);
-    CHECK(words[0] % 2 == 1);
-    CHECK(words[1] == 0);
-    return (words[0] - 1) / sizeof(void*);
-}
-
-} // namespace
-
 TEST_CASE("the virtual operations keep their order behind the two entries of the destructor") {
-    CHECK(slotOf(static_cast<void (DataFile::*)(unsigned long)>(&DataFile::open)) == 2);
+    CHECK(slotOfOpen<DataFile>() == 2);
     CHECK(slotOf(&DataFile::close) == 3);
     CHECK(slotOf(&DataFile::synchronize) == 4);
     CHECK(slotOf(&DataFile::getMode) == 5);

@@ -25,6 +25,7 @@
 #include <koru/string.h>
 
 #include "support/selfexec.h"
+#include "support/slots.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
 #include "support/throws.h"
@@ -32,6 +33,8 @@
 using Koru::File;
 using Koru::LogFile;
 using test::messageOf;
+using test::slotOf;
+using test::slotOfOpen;
 using namespace std::string_literals;
 
 namespace {
@@ -102,24 +105,8 @@ TEST_CASE("MAX_LINE_LENGTH is a constant of 32 bits, in the header and in the li
     CHECK(*looked == 1024U);
 }
 
-namespace {
-
-/// The place of a virtual operation in the table of its class. A pointer to a virtual member is
-/// one more than the operation's distance from the table's start (Itanium C++ ABI).
-template <class Member>
-std::size_t slotOf(Member member) {
-    static_assert(sizeof(Member) == 2 * sizeof(std::size_t), "");
-    std::size_t words[2];
-    std::memcpy(words, &member, sizeof words);
-    CHECK(words[0] % 2 == 1);
-    CHECK(words[1] == 0);
-    return (words[0] - 1) / sizeof(void*);
-}
-
-} // namespace
-
 TEST_CASE("open of a log is a virtual operation of its own behind those of a file") {
-    CHECK(slotOf(static_cast<void (File::*)(unsigned long)>(&File::open)) == 2);
+    CHECK(slotOfOpen<File>() == 2);
     CHECK(slotOf(&LogFile::close) == 3);
     CHECK(slotOf(&LogFile::synchronize) == 4);
     CHECK(slotOf(&LogFile::getMode) == 5);

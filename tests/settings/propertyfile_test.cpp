@@ -44,6 +44,7 @@
 #include "support/cancellation.h"
 #include "support/settingsfixture.h"
 #include "support/settingsmodel.h"
+#include "support/slots.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
 #include "support/throws.h"
@@ -56,6 +57,8 @@ using test::READ;
 using test::READ_WRITE;
 using test::sameName;
 using test::SettingsPlace;
+using test::slotOf;
+using test::slotOfOpen;
 using test::WRITE;
 using namespace std::string_literals;
 
@@ -414,24 +417,8 @@ TEST_CASE("the published line length is the largest of a 32-bit unsigned long") 
     CHECK(length == 4294967295UL);
 }
 
-namespace {
-
-/// The place of a virtual operation in the table of its class. A pointer to a virtual member is
-/// one more than the operation's distance from the table's start (Itanium C++ ABI).
-template <class Member>
-std::size_t slotOf(Member member) {
-    static_assert(sizeof(Member) == 2 * sizeof(std::size_t), "");
-    std::size_t words[2];
-    std::memcpy(words, &member, sizeof words);
-    CHECK(words[0] % 2 == 1);
-    CHECK(words[1] == 0);
-    return (words[0] - 1) / sizeof(void*);
-}
-
-} // namespace
-
 TEST_CASE("the virtual operations keep their order behind the two entries of the destructor") {
-    CHECK(slotOf(static_cast<void (PropertyFile::*)(unsigned long)>(&PropertyFile::open)) == 2);
+    CHECK(slotOfOpen<PropertyFile>() == 2);
     CHECK(slotOf(&PropertyFile::close) == 3);
     CHECK(slotOf(&PropertyFile::synchronize) == 4);
     CHECK(slotOf(&PropertyFile::getMode) == 5);
