@@ -29,8 +29,10 @@ KORU_EXPORT std::size_t length(wchar_t const* s);
 KORU_EXPORT std::size_t length(std::wstring const& s);
 
 /// Compares without regard to case, as `strcasecmp` and `wcscasecmp` (POSIX) do under the current C
-/// locale: negative, 0 or positive. Characters of 0x80000000 and above compare as the C library
-/// subtracts them, which is not a consistent order. Pointers must not be null.
+/// locale: negative, 0 or positive. Wide letters of ASCII, but for I and i, pair as in every locale
+/// of the C library, whatever a locale of one's own says. Characters of 0x80000000 and above
+/// compare as the C library subtracts them, which is not a consistent order. Pointers must not be
+/// null.
 KORU_EXPORT int compare(char const* a, char const* b);
 KORU_EXPORT int compare(std::string const& a, std::string const& b);
 KORU_EXPORT int compare(wchar_t const* a, wchar_t const* b);
