@@ -66,6 +66,8 @@ extern "C" wint_t towlower(wint_t c) noexcept {
 
 void* operator new(std::size_t size) { return _allocate(size); }
 void* operator new[](std::size_t size) { return _allocate(size); }
+void* operator new(std::size_t size, std::nothrow_t const&) noexcept { return _allocate(size); }
+void* operator new[](std::size_t size, std::nothrow_t const&) noexcept { return _allocate(size); }
 void operator delete(void* memory) noexcept { _free(memory); }
 void operator delete[](void* memory) noexcept { _free(memory); }
 void operator delete(void* memory, std::size_t) noexcept { _free(memory); }
