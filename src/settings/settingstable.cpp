@@ -87,7 +87,10 @@ std::size_t SettingsTable::find(std::wstring const& section, std::wstring const&
     constexpr std::size_t few = 4; // So many are compared sooner than the column is made.
     if (entries_.size() > few && entries_.size() != fingerprints_.size()) completeFingerprints();
     if (!fingerprints_.empty()) {
-        Fingerprint const wanted = toFingerprint(mixFingerprint(mixFingerprint(0, section), key));
+        // Nothing mixed into nothing is 0: all entries of a flat file are in the section of no
+        // name.
+        std::uint32_t const before = section.empty() ? 0 : mixFingerprint(0, section);
+        Fingerprint const wanted = toFingerprint(mixFingerprint(before, key));
         std::size_t i = findFingerprint(fingerprints_, wanted, 0);
         while (i != NOT_FOUND && !isAt(i)) i = findFingerprint(fingerprints_, wanted, i + 1);
         if (i != NOT_FOUND) return i;

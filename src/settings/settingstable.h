@@ -135,7 +135,8 @@ public:
     bool operator()(Entry const& entry) {
         if (entry.section != last_) {
             last_ = entry.section;
-            matches_ = areEqual(table_.sectionOf(entry), name_);
+            StoredText const& section = table_.sectionOf(entry);
+            matches_ = section.empty() ? name_.empty() || name_[0] == 0 : areEqual(section, name_);
         }
         return matches_;
     }
