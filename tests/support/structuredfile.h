@@ -4,7 +4,9 @@
 #define KORU_TESTS_STRUCTUREDFILE_H
 
 #include <algorithm>
+#include <cstddef>
 #include <cstdio>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -12,9 +14,29 @@
 #include <koru/initializationfile.h>
 #include <koru/propertyfile.h>
 
+#include "support/slots.h"
 #include "support/tempdir.h"
+#include "support/throws.h"
 
 namespace test {
+
+char const* const NOTHING = "<nothing>";
+char const* const NOT_OPENED = "failed to open file.";
+char const* const NOT_READ = "failed to read from file";
+char const* const NOT_WRITTEN = "failed to write to file";
+
+/// The message of the std::runtime_error that the callable throws.
+template <class Callable>
+std::string complaint(Callable callable) {
+    return messageOf<std::runtime_error>(callable);
+}
+
+/// An operation that takes the lock.
+template <class File>
+struct Operation {
+    char const* label;
+    void (*run)(File&);
+};
 
 inline std::wstring entryKey(int number) {
     char text[16];
@@ -27,19 +49,56 @@ inline std::string narrowKey(int number) {
     return std::string(key.begin(), key.end());
 }
 
+/// ASCII as a wide string.
+inline std::wstring wide(std::string const& text) { return std::wstring(text.begin(), text.end()); }
+
 /// The sectioned settings file, with one section.
 struct Sectioned {
     using File = Koru::InitializationFile;
     static char const* label() { return "initialization file"; }
-    static std::string bytes(int first, int end) {
+    static constexpr unsigned long ADDED_MODE = 0; ///< what `open` adds to the mode
+    static constexpr bool CLOSES_ALWAYS = true;    ///< whether the destructor closes what is closed
+
+    static std::string bytes(int first, int end, std::string const& value = "value") {
         std::string result = first == end ? "" : "[s]\n";
-        for (int i = first; i < end; ++i) result += narrowKey(i) + "=value\n";
+        for (int i = first; i < end; ++i) result += narrowKey(i) + "=" + value + "\n";
         return result;
     }
-    static void add(File& file, int number) { file.setValue(L"s", entryKey(number), L"value"); }
+    /// A file of entry 0 that is not what is written for it.
+    static std::string untidyBytes() { return "; comment\n\n" + bytes(0, 1); }
+
+    static void set(File& file, int number, std::string const& value = "value") {
+        file.setValue(L"s", entryKey(number), wide(value));
+    }
+    static void add(File& file, int number) { set(file, number); }
+    static void remove(File& file, int number) { file.removeKey(L"s", entryKey(number)); }
     static std::vector<std::wstring> keys(File& file) { return file.enumerateKeys(L"s"); }
     static std::wstring value(File& file, int number) {
         return file.getValue(L"s", entryKey(number));
+    }
+
+    static std::vector<std::size_t> ownSlots() {
+        return {slotOf(&File::enumerateSections), slotOf(&File::createSection),
+                slotOf(&File::removeSection),     slotOf(&File::enumerateKeys),
+                slotOf(&File::createKey),         slotOf(&File::removeKey),
+                slotOf(&File::getValue),          slotOf(&File::setValue)};
+    }
+    static std::vector<Operation<File>> ownOperations() {
+        return {
+            {"enumerateSections", [](File& f) { f.enumerateSections(); }},
+            {"createSection", [](File& f) { f.createSection(L"n"); }},
+            {"createSection that exists", [](File& f) { f.createSection(L"s"); }},
+            {"removeSection", [](File& f) { f.removeSection(L"s"); }},
+            {"enumerateKeys", [](File& f) { f.enumerateKeys(L"s"); }},
+            {"createKey", [](File& f) { f.createKey(L"s", L"n"); }},
+            {"createKey that exists", [](File& f) { f.createKey(L"s", entryKey(0)); }},
+            {"removeKey", [](File& f) { remove(f, 0); }},
+            {"removeKey of nothing", [](File& f) { remove(f, 1); }},
+            {"getValue", [](File& f) { value(f, 0); }},
+            {"getValue of nothing", [](File& f) { value(f, 1); }},
+            {"setValue", [](File& f) { set(f, 0, "w"); }},
+            {"setValue of a new key", [](File& f) { set(f, 1, "w"); }},
+        };
     }
 };
 
@@ -47,33 +106,78 @@ struct Sectioned {
 struct Flat {
     using File = Koru::PropertyFile;
     static char const* label() { return "property file"; }
-    static std::string bytes(int first, int end) {
+    static constexpr unsigned long ADDED_MODE = 0;
+    static constexpr bool CLOSES_ALWAYS = true;
+
+    static std::string bytes(int first, int end, std::string const& value = "value") {
         std::string result;
-        for (int i = first; i < end; ++i) result += narrowKey(i) + "=value\n";
+        for (int i = first; i < end; ++i) result += narrowKey(i) + "=" + value + "\n";
         return result;
     }
-    static void add(File& file, int number) { file.setValue(entryKey(number), L"value"); }
+    static std::string untidyBytes() { return "; comment\n\n" + bytes(0, 1); }
+
+    static void set(File& file, int number, std::string const& value = "value") {
+        file.setValue(entryKey(number), wide(value));
+    }
+    static void add(File& file, int number) { set(file, number); }
+    static void remove(File& file, int number) { file.removeKey(entryKey(number)); }
     static std::vector<std::wstring> keys(File& file) { return file.enumerateKeys(); }
     static std::wstring value(File& file, int number) { return file.getValue(entryKey(number)); }
+
+    static std::vector<std::size_t> ownSlots() {
+        return {slotOf(&File::enumerateKeys), slotOf(&File::createKey), slotOf(&File::removeKey),
+                slotOf(&File::getValue), slotOf(&File::setValue)};
+    }
+    static std::vector<Operation<File>> ownOperations() {
+        return {
+            {"enumerateKeys", [](File& f) { f.enumerateKeys(); }},
+            {"createKey", [](File& f) { f.createKey(L"n"); }},
+            {"createKey that exists", [](File& f) { f.createKey(entryKey(0)); }},
+            {"removeKey", [](File& f) { remove(f, 0); }},
+            {"removeKey of nothing", [](File& f) { remove(f, 1); }},
+            {"getValue", [](File& f) { value(f, 0); }},
+            {"getValue of nothing", [](File& f) { value(f, 1); }},
+            {"setValue", [](File& f) { set(f, 0, "w"); }},
+            {"setValue of a new key", [](File& f) { set(f, 1, "w"); }},
+        };
+    }
 };
 
 /// The record file. What a file of several records holds is known but for their order.
 struct Records {
     using File = Koru::DataFile;
+    using Record = Koru::DataFile::Record;
     static char const* label() { return "data file"; }
-    static std::string bytes(int first, int end) {
+    static constexpr unsigned long ADDED_MODE = Koru::File::BINARY;
+    static constexpr bool CLOSES_ALWAYS = false;
+
+    static std::string field(std::string const& bytes) {
         std::string result;
-        for (int i = first; i < end; ++i) {
-            std::string const key = narrowKey(i);
-            result += {static_cast<char>(2 * key.size()), 0, 0, 0};
-            for (char const c : key) result += {'\0', c};
-            result += std::string("\5\0\0\0value", 9);
-        }
+        for (int shift = 0; shift < 32; shift += 8)
+            result += static_cast<char>(bytes.size() >> shift);
+        return result + bytes;
+    }
+    static std::string keyField(std::string const& key) {
+        std::string result;
+        for (char const c : key) result += {'\0', c};
+        return field(result);
+    }
+    static std::string bytes(int first, int end, std::string const& value = "value") {
+        std::string result;
+        for (int i = first; i < end; ++i) result += keyField(narrowKey(i)) + field(value);
         return result;
     }
-    static void add(File& file, int number) {
-        file.insert({entryKey(number), {'v', 'a', 'l', 'u', 'e'}});
+    static std::string untidyBytes() { return keyField(" " + narrowKey(0)) + field("value"); }
+
+    static Record record(int number, std::string const& value = "value") {
+        return {entryKey(number), {value.begin(), value.end()}};
     }
+    static void set(File& file, int number, std::string const& value = "value") {
+        remove(file, number);
+        file.insert(record(number, value));
+    }
+    static void add(File& file, int number) { file.insert(record(number)); }
+    static void remove(File& file, int number) { file.remove(record(number)); }
     static std::vector<std::wstring> keys(File& file) {
         std::vector<std::wstring> result;
         for (unsigned long i = 0; i < file.size(); ++i) result.push_back(file[i].getKey());
@@ -81,11 +185,23 @@ struct Records {
     }
     static std::wstring value(File& file, int number) {
         for (unsigned long i = 0; i < file.size(); ++i) {
-            Koru::DataFile::Record const& record = file[i];
-            if (record.getKey() != entryKey(number)) continue;
-            return std::wstring(record.getData().begin(), record.getData().end());
+            Record const& held = file[i];
+            if (held.getKey() != entryKey(number)) continue;
+            return std::wstring(held.getData().begin(), held.getData().end());
         }
         return L"";
+    }
+
+    static std::vector<std::size_t> ownSlots() { return {}; }
+    static std::vector<Operation<File>> ownOperations() {
+        return {
+            {"size", [](File& f) { static_cast<void>(f.size()); }},
+            {"operator[]", [](File& f) { static_cast<void>(f[0]); }},
+            {"insert", [](File& f) { add(f, 1); }},
+            {"insert of an equal key", [](File& f) { add(f, 0); }},
+            {"remove", [](File& f) { remove(f, 0); }},
+            {"remove of nothing", [](File& f) { remove(f, 1); }},
+        };
     }
 };
 
@@ -94,14 +210,15 @@ std::size_t sizeOf(typename Family::File& file) {
     return Family::keys(file).size();
 }
 
-/// Whether the file holds the entries from `first` up to `end` and no others, in whatever order.
+/// Whether the file holds the entries from `first` up to `end` and no others, in whatever order,
+/// and the last one has this value.
 template <class Family>
-bool holds(typename Family::File& file, int first, int end) {
+bool holds(typename Family::File& file, int first, int end, std::string const& value = "value") {
     std::vector<std::wstring> keys = Family::keys(file);
     std::sort(keys.begin(), keys.end());
     std::vector<std::wstring> expected;
     for (int i = first; i < end; ++i) expected.push_back(entryKey(i));
-    return keys == expected && (first == end || Family::value(file, end - 1) == L"value");
+    return keys == expected && (first == end || Family::value(file, end - 1) == wide(value));
 }
 
 /// Whether the bytes are a whole file of these entries.
@@ -113,6 +230,18 @@ bool isWhole(std::string const& bytes, int first, int end) {
     typename Family::File file(directory / "copy");
     file.open(Koru::File::READ);
     return holds<Family>(file, first, end);
+}
+
+/// What a caller sees of a file that is open, with a value of this size.
+inline std::string openState(unsigned long mode, std::size_t size) {
+    return "open, mode " + std::to_string(mode) + ", value of " + std::to_string(size) + "; ";
+}
+
+/// What a caller sees of a file and its entry 0.
+template <class Family>
+std::string stateOf(typename Family::File& file) {
+    if (!file.is_open()) return "closed; ";
+    return openState(file.getMode(), Family::value(file, 0).size());
 }
 
 } // namespace test

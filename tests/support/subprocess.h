@@ -57,6 +57,21 @@ Outcome inChild(Callable callable) {
     return outcome;
 }
 
+/// The text that the callable returns in a child process, or how the child ended instead. A child
+/// that takes longer than a minute is ended by a signal.
+template <class Callable>
+std::string toldByChild(Callable callable) {
+    Outcome const outcome = inChild([&] {
+        ::alarm(60);
+        std::string const text = callable();
+        std::fwrite(text.data(), 1, text.size(), stdout);
+        return 0;
+    });
+    if (outcome.signal != 0) return "signal " + std::to_string(outcome.signal);
+    if (outcome.exitCode != 0) return "exit code " + std::to_string(outcome.exitCode);
+    return outcome.out;
+}
+
 /// Runs a program by exec. `arguments` begins with argv[0], which may differ from `program`; the
 /// child changes to `directory` first, unless that is empty.
 inline Outcome execute(std::string const& program, std::vector<std::string> arguments,

@@ -72,6 +72,34 @@ private:
     CallPlan& plan_;
 };
 
+/// How many bytes a call transfers at the most; 0: as many as it is asked for.
+inline std::atomic<std::size_t> transferLimit{0};
+
+/// Limits what calls transfer within a scope.
+class ShortTransfers {
+public:
+    explicit ShortTransfers(std::size_t bytes) { transferLimit = bytes; }
+    ShortTransfers(ShortTransfers const&) = delete;
+    ShortTransfers& operator=(ShortTransfers const&) = delete;
+    ~ShortTransfers() { transferLimit = 0; }
+};
+
+inline std::size_t limited(std::size_t count) {
+    std::size_t const limit = transferLimit;
+    return limit != 0 && count > limit ? limit : count;
+}
+
+/// Whether writing waits, and whether a call does wait.
+inline std::atomic<bool> writesWait{false};
+inline std::atomic<bool> aWriteWaits{false};
+
+inline void waitIfAsked() {
+    while (writesWait) {
+        aWriteWaits = true;
+        ::usleep(1000);
+    }
+}
+
 /// Whether a call fails now, with errno set.
 inline bool failsNow(Call call) {
     CallPlan& plan = planOf(call);
@@ -119,19 +147,29 @@ extern "C" FILE* fopen64(char const* name, char const* mode) {
 extern "C" ssize_t read(int fd, void* buffer, size_t count) {
     test::passCancellationPoint();
     if (test::failsNow(test::Call::READ)) return -1;
-    return test::realFunction<ssize_t (*)(int, void*, size_t)>("read")(fd, buffer, count);
+    return test::realFunction<ssize_t (*)(int, void*, size_t)>("read")(fd, buffer,
+                                                                       test::limited(count));
 }
 
 extern "C" ssize_t write(int fd, void const* buffer, size_t count) {
     test::passCancellationPoint();
+    test::waitIfAsked();
     if (test::failsNow(test::Call::WRITE)) return -1;
-    return test::realFunction<ssize_t (*)(int, void const*, size_t)>("write")(fd, buffer, count);
+    return test::realFunction<ssize_t (*)(int, void const*, size_t)>("write")(fd, buffer,
+                                                                              test::limited(count));
 }
 
 extern "C" ssize_t writev(int fd, iovec const* pieces, int count) {
     test::passCancellationPoint();
+    test::waitIfAsked();
     if (test::failsNow(test::Call::WRITE)) return -1;
-    return test::realFunction<ssize_t (*)(int, iovec const*, int)>("writev")(fd, pieces, count);
+    auto const writev = test::realFunction<ssize_t (*)(int, iovec const*, int)>("writev");
+    if (test::transferLimit != 0) {
+        iovec first = count > 1 && pieces[0].iov_len == 0 ? pieces[1] : pieces[0];
+        first.iov_len = test::limited(first.iov_len);
+        return writev(fd, &first, 1);
+    }
+    return writev(fd, pieces, count);
 }
 
 extern "C" off64_t lseek64(int fd, off64_t offset, int whence) noexcept {

@@ -54,6 +54,24 @@ inline std::string readFile(std::string const& path) {
     return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
 }
 
+/// A file's place in a directory of its own, without the file at first.
+class Place {
+public:
+    std::string const& path() const { return path_; }
+    TempDir const& directory() const { return directory_; }
+    /// Writes a new file; some file systems are slow in emptying one that is there.
+    void write(std::string const& bytes) const {
+        std::filesystem::remove(path_);
+        writeFile(path_, bytes);
+    }
+    std::string bytes() const { return readFile(path_); }
+    bool exists() const { return std::filesystem::exists(path_); }
+
+private:
+    TempDir directory_;
+    std::string path_ = directory_ / "file";
+};
+
 } // namespace test
 
 #endif
