@@ -42,6 +42,7 @@
 #include <koru/datafile.h>
 
 #include "records/recordfixture.h"
+#include "support/shown.h"
 #include "support/slots.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
@@ -285,7 +286,7 @@ TEST_CASE("a key that is empty or begins with NUL is refused and changes nothing
     std::wstring const nul(1, L'\0');
     for (std::wstring const& key : {L""s, nul, nul + L"a", L" \t" + nul, L"\n" + nul + L" ",
                                     L"  " + nul + L"a  ", nul + nul}) {
-        CAPTURE(test::shownText(key));
+        CAPTURE(test::shown(key));
         Record changed(L"before", bytes("data"));
         CHECK(messageOf<std::invalid_argument>([&] { changed.setKey(key); }) == NO_KEY);
         checkKey(changed.getKey(), L"before");
@@ -322,7 +323,7 @@ TEST_CASE("every key of up to five characters is trimmed or refused as the plain
             bool const same =
                 messageOf<std::invalid_argument>([&] { changed.setKey(key); }) == message &&
                 changed.getKey() == expected;
-            if (!same && differences++ == 0) CHECK(test::shownText(key) == "as expected");
+            if (!same && differences++ == 0) CHECK(test::shown(key) == "as expected");
         }
     }
     CHECK(differences == 0);
@@ -406,7 +407,7 @@ TEST_CASE("records are written as length and key, length and data") {
     for (Row const& row : rows) {
         CAPTURE(row.label);
         std::string const actual = written(place, {record(row.key, row.data)});
-        CHECK(test::shownText(actual) == test::shownText(row.expected));
+        CHECK(test::shown(actual) == test::shown(row.expected));
     }
 }
 
@@ -479,7 +480,7 @@ TEST_CASE("what 8 bits make of the ends of a key is trimmed or refused when it i
              {L"\u0120\u0100a", NO_KEY, {}},
              {L"\u0100", NO_KEY, {}},
          }) {
-        CAPTURE(test::shownText(row.key));
+        CAPTURE(test::shown(row.key));
         written(place, {record(row.key)});
         DataFile file(place.path());
         CHECK(openMessage(file, READ) == row.message);
@@ -719,7 +720,7 @@ void checkFaultless(RecordPlace const& place, std::vector<std::string> const& co
         for (std::string const& content : contents) {
             std::string const fault = faultWith(place, content);
             if (fault.empty()) continue;
-            say("%s: %s\n", test::shownText(content).c_str(), fault.c_str());
+            say("%s: %s\n", test::shown(content).c_str(), fault.c_str());
         }
         say("tried all");
         return 0;

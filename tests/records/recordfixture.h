@@ -23,6 +23,7 @@
 
 #include <koru/datafile.h>
 
+#include "support/shown.h"
 #include "support/tempdir.h"
 
 namespace test {
@@ -171,32 +172,10 @@ inline Entries sorted(Entries entries) {
     return entries;
 }
 
-/// Text and bytes for a test's output: what is not printable as a number in hexadecimal.
-template <class Text>
-std::string shownText(Text const& text) {
-    static char const digits[] = "0123456789abcdef";
-    std::string result;
-    std::size_t shownSoFar = 0;
-    for (auto const c : text) {
-        if (++shownSoFar > 100) return result + "... of " + std::to_string(text.size());
-        auto const number = static_cast<std::uint32_t>(c);
-        if (number >= 0x20 && number < 0x7F && number != '<') {
-            result += static_cast<char>(number);
-            continue;
-        }
-        result += '<';
-        for (int shift = number > 0xFF ? 28 : 4; shift >= 0; shift -= 4) {
-            result += digits[number >> shift & 15U];
-        }
-        result += '>';
-    }
-    return result;
-}
-
 inline std::string shown(Entries const& entries) {
     std::string result;
     for (std::size_t i = 0; i < entries.size() && i < 50; ++i) {
-        result += shownText(entries[i].key) + ": " + shownText(entries[i].data) + '\n';
+        result += shownStart(entries[i].key, 100) + ": " + shownStart(entries[i].data, 100) + '\n';
     }
     return result;
 }
@@ -214,7 +193,7 @@ inline void checkSameRecords(Entries const& actual, Entries const& expected) {
 }
 
 inline void checkKey(std::wstring const& actual, std::wstring const& expected) {
-    CHECK(shownText(actual) == shownText(expected));
+    CHECK(shown(actual) == shown(expected));
 }
 
 /// Positions follow the addresses of the records.

@@ -13,7 +13,7 @@
 
 #include "settings/storedtext.h"
 #include "support/locales.h"
-#include "support/settingsmodel.h"
+#include "support/shown.h"
 
 namespace Koru {
 

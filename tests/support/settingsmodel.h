@@ -12,6 +12,8 @@
 #include <koru/file.h>
 #include <koru/string.h>
 
+#include "support/shown.h"
+
 namespace test {
 
 /// An entry of the table.
@@ -26,41 +28,6 @@ inline bool operator==(Setting const& a, Setting const& b) {
 }
 
 using Settings = std::vector<Setting>;
-
-/// A wide string for a test's output: what is not printable ASCII as its number in hexadecimal,
-/// between angle brackets.
-inline std::string shown(std::wstring const& text) {
-    static char const digits[] = "0123456789abcdef";
-    std::string result;
-    for (wchar_t const c : text) {
-        if (c >= 0x20 && c < 0x7F && c != L'<') {
-            result += static_cast<char>(c);
-            continue;
-        }
-        result += '<';
-        bool leading = true;
-        for (int shift = 28; shift >= 0; shift -= 4) {
-            unsigned const digit = (static_cast<unsigned>(c) >> shift) & 15U;
-            leading = leading && digit == 0 && shift > 0;
-            if (!leading) result += digits[digit];
-        }
-        result += '>';
-    }
-    return result;
-}
-
-/// The same for bytes.
-inline std::string shown(std::string const& bytes) {
-    std::wstring wide;
-    for (char const c : bytes) wide += static_cast<wchar_t>(static_cast<unsigned char>(c));
-    return shown(wide);
-}
-
-inline std::string shown(std::vector<std::wstring> const& names) {
-    std::string result;
-    for (std::wstring const& name : names) result += '"' + shown(name) + "\" ";
-    return result;
-}
 
 inline std::string shown(Settings const& settings) {
     std::string result;
