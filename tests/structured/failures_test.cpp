@@ -4,6 +4,7 @@
 #include <grp.h>
 #include <sched.h>
 #include <signal.h>
+#include <stdlib.h>
 #include <sys/mount.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
@@ -12,38 +13,16 @@
 #include <cerrno>
 #include <cstddef>
 #include <filesystem>
+#include <fstream>
 #include <string>
 
-#include "support/structuredfile.h"
+#include "structured/fixture.h"
 #include "support/subprocess.h"
 #include "support/systemcalls.h"
-#include "support/tempdir.h"
-#include "support/throws.h"
 
-using test::Call;
-using test::complaint;
-using test::FailingCall;
-using test::Flat;
-using test::holds;
-using test::isWhole;
-using test::NOT_OPENED;
-using test::NOT_READ;
-using test::NOT_WRITTEN;
-using test::NOTHING;
-using test::openState;
-using test::Place;
-using test::Records;
-using test::Sectioned;
-using test::ShortTransfers;
-using test::sizeOf;
-using test::stateOf;
-using test::toldByChild;
+using namespace structured;
 
 namespace {
-
-unsigned long const READ = Koru::File::READ;
-unsigned long const WRITE = Koru::File::WRITE;
-unsigned long const READ_WRITE = READ | WRITE;
 
 /// What the callable throws while calls of one kind fail, but for the first ones.
 template <class Callable>
@@ -57,6 +36,19 @@ void writeBack(File& file, bool synchronize) {
     synchronize ? file.synchronize() : file.close();
 }
 
+/// What a caller sees of a file that is open, with a value of this size, after a step.
+std::string ended(std::string const& message, std::size_t size) {
+    return message + ", open with " + std::to_string(size) + "; ";
+}
+
+/// The same of a file and its entry 0.
+template <class Family, class Step>
+std::string after(OwnFile<Family>& file, unsigned long mode, Step step) {
+    std::string const message = complaint(step);
+    if (!file.isOpen(mode)) return message + ", closed or in another mode; ";
+    return ended(message, Family::value(file, 0).size());
+}
+
 bool isPrefix(std::string const& part, std::string const& whole) {
     return whole.compare(0, part.size(), part) == 0;
 }
@@ -65,181 +57,151 @@ bool isPrefix(std::string const& part, std::string const& whole) {
 
 TEST_CASE_TEMPLATE("a write-back that cannot open the file again keeps the entries and closes it",
                    Family, Sectioned, Flat, Records) {
-    test::TempDir const directory;
-    std::string const folder = directory / "folder";
-    std::string const path = folder + "/file";
     for (bool const synchronize : {false, true}) {
         for (bool const obstructed : {false, true}) {
             CAPTURE(synchronize);
             CAPTURE(obstructed);
-            std::filesystem::create_directory(folder);
-            typename Family::File file(path);
-            file.open(READ_WRITE);
-            Family::add(file, 1);
-            Family::add(file, 0);
+            OwnFile<Family> file("", READ_WRITE);
+            file.put(1);
+            file.put(0);
+            std::string const folder = file.place.directory().path();
             std::filesystem::remove_all(folder);
-            if (obstructed) std::filesystem::create_directories(path + "/content");
+            if (obstructed) std::filesystem::create_directories(file.place.path() + "/content");
             CHECK(complaint([&] { writeBack(file, synchronize); }) == NOT_OPENED);
             CHECK(!file.is_open());
             CHECK(file.getMode() == 0);
-            CHECK(holds<Family>(file, 0, 2));
+            CHECK(file.has(2));
             std::filesystem::remove_all(folder);
             std::filesystem::create_directory(folder);
             // They can be written once there is a place for them.
             file.setMode(WRITE);
             file.close();
-            CHECK(isWhole<Family>(test::readFile(path), 0, 2));
-            std::filesystem::remove_all(folder);
+            CHECK(isWhole<Family>(file.bytes(), 0, 2));
         }
     }
 }
 
 TEST_CASE_TEMPLATE("a destructor that cannot open the file again keeps the exception inside",
                    Family, Sectioned, Flat, Records) {
-    test::Outcome const outcome = test::inChild([] {
-        test::TempDir const directory;
-        std::string const folder = directory / "folder";
-        std::filesystem::create_directory(folder);
-        {
-            typename Family::File file(folder + "/file");
-            file.open(WRITE);
-            Family::set(file, 0);
-            std::filesystem::remove_all(folder);
-        }
-        return 42;
-    });
-    CHECK(outcome.exitCode == 42);
-    CHECK(outcome.out == "");
+    CHECK(toldByChild([] {
+              OwnFile<Family> file("", WRITE);
+              file.put(0);
+              std::filesystem::remove_all(file.place.directory().path());
+              return "alive";
+          }) == "alive");
 }
 
 TEST_CASE_TEMPLATE("a directory cannot be read and cannot be opened for writing", Family, Sectioned,
                    Flat, Records) {
-    Place const place;
-    std::filesystem::create_directory(place.path());
-    typename Family::File file(place.path());
-    Family::set(file, 0);
+    OwnFile<Family> file;
+    std::filesystem::create_directory(file.place.path());
+    file.put(0);
     CHECK(complaint([&] { file.open(READ); }) == NOT_READ);
-    CHECK(file.is_open());
-    CHECK(file.getMode() == (READ | Family::ADDED_MODE));
-    CHECK(sizeOf<Family>(file) == 0);
+    CHECK(file.isOpen(READ));
+    CHECK(file.count() == 0);
     CHECK(complaint([&] { file.synchronize(); }) == NOT_READ);
     CHECK(complaint([&] { file.close(); }) == NOTHING);
     CHECK(complaint([&] { file.open(READ_WRITE); }) == NOT_OPENED);
     CHECK(complaint([&] { file.open(WRITE); }) == NOT_OPENED);
-    CHECK(std::filesystem::is_directory(place.path()));
+    CHECK(std::filesystem::is_directory(file.place.path()));
 }
 
 TEST_CASE_TEMPLATE("a file whose first read fails is not an empty file", Family, Sectioned, Flat,
                    Records) {
-    typename Family::File file(std::string("/proc/self/mem"));
+    OwnFile<Family> file;
+    std::filesystem::create_symlink("/proc/self/mem", file.place.path());
     CHECK(complaint([&] { file.open(READ); }) == NOT_READ);
-    CHECK(file.is_open());
-    CHECK(file.getMode() == (READ | Family::ADDED_MODE));
-    CHECK(sizeOf<Family>(file) == 0);
+    CHECK(file.isOpen(READ));
+    CHECK(file.count() == 0);
 }
 
 TEST_CASE_TEMPLATE("a read that fails midway is an error and keeps the complete entries before it",
                    Family, Sectioned, Flat, Records) {
-    Place const place;
-    int const count = 200;
-    std::string const bytes = Family::bytes(0, count);
-    place.write(bytes);
-    std::size_t const entry = Family::bytes(0, 2).size() - Family::bytes(0, 1).size();
-    std::size_t const header = Family::bytes(0, 1).size() - entry;
+    OwnFile<Family> file(Family::bytes(0, 200));
+    std::size_t const entry = Family::bytes(0, 2).size() - one<Family>().size();
+    std::size_t const header = one<Family>().size() - entry;
     for (std::size_t const limit : {13UL, 100UL, 1000UL}) {
         ShortTransfers const limited(limit);
-        for (std::size_t delivered = 0; delivered <= bytes.size(); delivered += limit) {
+        for (std::size_t read = 0; read <= header + 200 * entry; read += limit) {
             CAPTURE(limit);
-            CAPTURE(delivered);
-            typename Family::File file(place.path());
-            CHECK(complaintWithout(Call::READ, EIO, static_cast<long>(delivered / limit),
+            CAPTURE(read);
+            CHECK(complaintWithout(Call::READ, EIO, static_cast<long>(read / limit),
                                    [&] { file.open(READ); }) == NOT_READ);
-            CHECK(file.is_open());
-            CHECK(file.getMode() == (READ | Family::ADDED_MODE));
-            auto const complete = delivered < header ? 0 : (delivered - header) / entry;
-            CHECK(holds<Family>(file, 0, static_cast<int>(complete)));
+            CHECK(file.isOpen(READ));
+            CHECK(file.has(static_cast<int>(read < header ? 0 : (read - header) / entry)));
+            file.close();
         }
     }
 }
 
-TEST_CASE_TEMPLATE("a read that fails behind any block of a large file is an error", Family,
-                   Sectioned, Flat, Records) {
-    Place const place;
+TEST_CASE_TEMPLATE("a read that fails midway is not the end of the file", Family, Sectioned, Flat,
+                   Records) {
     int const count = 20000;
-    place.write(Family::bytes(0, count));
+    OwnFile<Family> file(Family::bytes(0, count));
     std::size_t most = 0;
-    std::string message = NOT_READ;
-    for (long before = 0; message != NOTHING; ++before) {
+    for (long before = 0;; ++before) {
         CAPTURE(before);
-        typename Family::File file(place.path());
-        message = complaintWithout(Call::READ, EIO, before, [&] { file.open(READ); });
-        if (message == NOTHING) CHECK(sizeOf<Family>(file) == static_cast<std::size_t>(count));
+        std::string const message =
+            complaintWithout(Call::READ, EIO, before, [&] { file.open(READ); });
         if (message == NOTHING) break;
         CHECK(message == NOT_READ);
-        most = sizeOf<Family>(file);
-        CHECK(holds<Family>(file, 0, static_cast<int>(most)));
+        most = file.count();
+        CHECK(file.has(static_cast<int>(most)));
+        file.close();
     }
     CHECK(most > 0);
+    CHECK(file.has(count));
 }
 
-TEST_CASE_TEMPLATE("a file that could not be read is kept by taking the write bit away", Family,
-                   Sectioned, Flat, Records) {
-    Place const place;
-    place.write(Family::bytes(0, 1));
-    typename Family::File file(place.path());
+TEST_CASE_TEMPLATE(
+    "a file that could not be read is kept by taking the write bit away before close", Family,
+    Sectioned, Flat, Records) {
+    OwnFile<Family> file(one<Family>());
     CHECK(complaintWithout(Call::READ, EIO, 0, [&] { file.open(READ_WRITE); }) == NOT_READ);
-    CHECK(file.getMode() == (READ_WRITE | Family::ADDED_MODE));
-    CHECK(place.bytes() == Family::bytes(0, 1));
+    CHECK(file.isOpen(READ_WRITE));
+    CHECK(file.bytes() == one<Family>());
     file.setMode(READ);
     file.close();
-    CHECK(place.bytes() == Family::bytes(0, 1));
+    CHECK(file.bytes() == one<Family>());
 }
 
 TEST_CASE_TEMPLATE("reads and writes that transfer little at a time make no difference", Family,
                    Sectioned, Flat, Records) {
-    Place const place;
     for (std::size_t const limit : {1UL, 7UL, 1000UL}) {
         CAPTURE(limit);
         ShortTransfers const limited(limit);
-        typename Family::File file(place.path());
-        file.open(WRITE);
-        for (int i = 0; i < 300; ++i) Family::add(file, i);
+        OwnFile<Family> file("", WRITE);
+        for (int i = 0; i < 300; ++i) file.put(i);
         file.close();
-        CHECK(isWhole<Family>(place.bytes(), 0, 300));
+        CHECK(isWhole<Family>(file.bytes(), 0, 300));
         file.open(READ);
-        CHECK(holds<Family>(file, 0, 300));
+        CHECK(file.has(300));
     }
 }
 
 TEST_CASE_TEMPLATE("a write that fails leaves the entries, the file open and the mode unchanged",
                    Family, Sectioned, Flat, Records) {
-    Place const place;
     for (std::size_t const size : {1UL, 100UL, 5000UL, 300000UL}) {
         for (bool const synchronize : {false, true}) {
             for (unsigned long const mode : {WRITE, READ_WRITE}) {
                 CAPTURE(size);
                 CAPTURE(synchronize);
                 CAPTURE(mode);
-                std::string const value(size, 'x');
-                std::string const open = openState(mode | Family::ADDED_MODE, size);
-                place.write(Family::bytes(0, 1, "old value"));
-                typename Family::File file(place.path());
-                file.open(mode);
-                Family::set(file, 0, value);
-                std::string message = NOT_WRITTEN;
-                long failures = 0;
-                for (; message != NOTHING; ++failures) {
-                    CAPTURE(failures);
-                    message = complaintWithout(Call::WRITE, ENOSPC, failures,
-                                               [&] { writeBack(file, synchronize); });
-                    if (message == NOTHING) break;
-                    CHECK(message == NOT_WRITTEN);
-                    CHECK(stateOf<Family>(file) == open);
-                    CHECK(isPrefix(place.bytes(), Family::bytes(0, 1, value)));
+                std::string const complete = one<Family>(std::string(size, 'x'));
+                OwnFile<Family> file(one<Family>("old value"), mode);
+                file.put(0, std::string(size, 'x'));
+                for (long before = 0;; ++before) {
+                    CAPTURE(before);
+                    std::string const result = after(file, mode, [&] {
+                        FailingCall const fault(Call::WRITE, ENOSPC, before, FailingCall::FOR_EVER);
+                        writeBack(file, synchronize);
+                    });
+                    if (before > 0 && result.rfind(NOTHING, 0) == 0) break;
+                    CHECK(result == ended(NOT_WRITTEN, size));
+                    CHECK(isPrefix(file.bytes(), complete));
                 }
-                CHECK(failures > 0);
-                if (!synchronize) CHECK((place.bytes() == Family::bytes(0, 1, value)));
-                if (synchronize && mode == READ_WRITE) CHECK(stateOf<Family>(file) == open);
+                if (!synchronize) CHECK((file.bytes() == complete));
+                if (synchronize && mode == READ_WRITE) CHECK(Family::value(file, 0).size() == size);
             }
         }
     }
@@ -247,20 +209,18 @@ TEST_CASE_TEMPLATE("a write that fails leaves the entries, the file open and the
 
 TEST_CASE_TEMPLATE("after a write that failed the next close writes everything", Family, Sectioned,
                    Flat, Records) {
-    Place const place;
-    typename Family::File file(place.path());
-    file.open(READ_WRITE);
-    for (int i = 0; i < 2000; ++i) Family::add(file, i * 7 % 2000);
+    OwnFile<Family> file("", READ_WRITE);
+    for (int i = 0; i < 2000; ++i) file.put(i * 7 % 2000);
     {
         ShortTransfers const limited(10000);
         CHECK(complaintWithout(Call::WRITE, ENOSPC, 1, [&] { file.close(); }) == NOT_WRITTEN);
     }
-    std::string const left = place.bytes();
+    std::string const left = file.bytes();
     CHECK(!left.empty());
-    CHECK(holds<Family>(file, 0, 2000));
+    CHECK(file.has(2000));
     file.close();
-    CHECK(isWhole<Family>(place.bytes(), 0, 2000));
-    CHECK(isPrefix(left, place.bytes()));
+    CHECK(isWhole<Family>(file.bytes(), 0, 2000));
+    CHECK(isPrefix(left, file.bytes()));
 }
 
 namespace {
@@ -277,52 +237,49 @@ void limitFileSize(rlim_t bytes) {
 } // namespace
 
 TEST_CASE_TEMPLATE("a file-size limit is a failure to write", Family, Sectioned, Flat, Records) {
-    Place const place;
     for (std::size_t const size : {1UL, 100UL, 200000UL}) {
-        for (rlim_t const limit : {rlim_t(0), rlim_t(1), rlim_t(5)}) {
+        for (rlim_t const limit : {0UL, 1UL, 5UL}) {
             CAPTURE(size);
             CAPTURE(limit);
-            std::string const complete = Family::bytes(0, 1, std::string(size, 'x'));
+            std::string const complete = one<Family>(std::string(size, 'x'));
             std::string const told = toldByChild([&] {
-                typename Family::File file(place.path());
-                file.open(READ_WRITE);
-                Family::set(file, 0, std::string(size, 'x'));
+                OwnFile<Family> file("", READ_WRITE);
+                file.put(0, std::string(size, 'x'));
                 limitFileSize(limit);
-                std::string text = complaint([&] { file.close(); }) + ": " + stateOf<Family>(file);
-                text += isPrefix(place.bytes(), complete) ? "prefix; " : "other; ";
-                text += complaint([&] { file.synchronize(); }) + ": " + stateOf<Family>(file);
+                std::string text = after(file, READ_WRITE, [&] { file.close(); });
+                text += isPrefix(file.bytes(), complete) ? "prefix; " : "other; ";
+                text += after(file, READ_WRITE, [&] { file.synchronize(); });
                 limitFileSize(RLIM_INFINITY);
-                text += complaint([&] { file.synchronize(); }) + ": " + stateOf<Family>(file);
-                return text + (place.bytes() == complete ? "complete" : "incomplete");
+                text += after(file, READ_WRITE, [&] { file.synchronize(); });
+                return text + (file.bytes() == complete ? "complete" : "incomplete");
             });
-            std::string const state = ": " + openState(READ_WRITE | Family::ADDED_MODE, size);
-            CHECK(told == NOT_WRITTEN + state + "prefix; " + NOT_WRITTEN + state + NOTHING + state +
-                              "complete");
+            std::string const notWritten = ended(NOT_WRITTEN, size);
+            CHECK(told == notWritten + "prefix; " + notWritten + ended(NOTHING, size) + "complete");
         }
     }
 }
 
 TEST_CASE_TEMPLATE("a destructor that cannot write does not end the process", Family, Sectioned,
                    Flat, Records) {
-    Place const place;
     for (std::size_t const size : {1UL, 200000UL}) {
-        CAPTURE(size);
-        CHECK(toldByChild([&] {
-                  limitFileSize(2);
-                  std::string messages;
-                  for (bool const closes : {false, true}) {
-                      for (bool const throws : {false, true}) {
-                          typename Family::File file(place.path());
-                          file.open(WRITE);
-                          Family::set(file, 0, std::string(size, 'x'));
-                          if (closes) messages += complaint([&] { file.close(); }) + "; ";
+        for (bool const closes : {false, true}) {
+            for (bool const throws : {false, true}) {
+                CAPTURE(size);
+                CAPTURE(closes);
+                CAPTURE(throws);
+                CHECK(toldByChild([&] {
+                          limitFileSize(2);
+                          OwnFile<Family> file("", WRITE);
+                          file.put(0, std::string(size, 'x'));
+                          std::string const message =
+                              closes ? complaint([&] { file.close(); }) : NOT_WRITTEN;
                           file.clear();
-                          std::ios::iostate const all = std::ios::badbit | std::ios::failbit;
-                          if (throws) file.exceptions(all | std::ios::eofbit);
-                      }
-                  }
-                  return messages;
-              }) == std::string(NOT_WRITTEN) + "; " + NOT_WRITTEN + "; ");
+                          auto const all = std::ios::badbit | std::ios::failbit | std::ios::eofbit;
+                          if (throws) file.exceptions(all);
+                          return message;
+                      }) == NOT_WRITTEN);
+            }
+        }
     }
 }
 
@@ -357,34 +314,28 @@ private:
 } // namespace
 
 TEST_CASE_TEMPLATE("a full disk is a failure to write", Family, Sectioned, Flat, Records) {
-    test::TempDir const directory;
-    std::string const small = directory / "small";
-    std::filesystem::create_directory(small);
+    TempDir const directory;
     std::string const told = toldByChild([&] {
-        Mount const disk("none", small, "tmpfs", 0, "size=8k");
+        Mount const disk("none", directory.path(), "tmpfs", 0, "size=8k");
         if (!disk.done()) return std::string(CANNOT_MOUNT);
-        test::writeFile(small + "/file", Family::bytes(0, 1));
-        typename Family::File file(small + "/file");
-        file.open(READ_WRITE);
-        Family::set(file, 0, std::string(100000, 'x'));
-        std::string text = complaint([&] { file.close(); }) + ": " + stateOf<Family>(file);
-        text += complaint([&] { file.synchronize(); }) + ": " + stateOf<Family>(file);
-        Family::set(file, 0, "short");
-        text += complaint([&] { file.synchronize(); }) + ": " + stateOf<Family>(file);
+        ::setenv("TMPDIR", directory.path().c_str(), 1);
+        OwnFile<Family> file("", READ_WRITE);
+        file.put(0, std::string(100000, 'x'));
+        std::string text = after(file, READ_WRITE, [&] { file.close(); });
+        text += after(file, READ_WRITE, [&] { file.synchronize(); });
+        file.put(0, "short");
+        text += after(file, READ_WRITE, [&] { file.synchronize(); });
         // A disk that somebody else filled before.
-        std::ofstream(small + "/filler") << std::string(20000, 'f');
-        Family::set(file, 0, std::string(5000, 'y'));
-        text += complaint([&] { file.close(); }) + ": " + stateOf<Family>(file);
-        return text; // the destructor meets the full disk once more
-    });
+        std::ofstream(directory / "filler") << std::string(20000, 'f');
+        file.put(0, std::string(5000, 'y'));
+        return text + after(file, READ_WRITE, [&] { file.close(); });
+    }); // the destructor met the full disk once more
     if (told == CANNOT_MOUNT) {
         MESSAGE("no file system can be mounted here: the full disk was not tested");
         return;
     }
-    unsigned long const mode = READ_WRITE | Family::ADDED_MODE;
-    std::string const notWritten = std::string(NOT_WRITTEN) + ": ";
-    CHECK(told == notWritten + openState(mode, 100000) + notWritten + openState(mode, 100000) +
-                      NOTHING + ": " + openState(mode, 5) + notWritten + openState(mode, 5000));
+    CHECK(told == ended(NOT_WRITTEN, 100000) + ended(NOT_WRITTEN, 100000) + ended(NOTHING, 5) +
+                      ended(NOT_WRITTEN, 5000));
 }
 
 namespace {
@@ -413,7 +364,7 @@ template <class Family, class Replace>
 void checkReplacements(Place const& place, Replace replace) {
     for (std::size_t i = 0; i < 4; ++i) {
         CAPTURE(i);
-        place.write(Family::bytes(0, 1, OLD_VALUES[i % 3]));
+        place.write(one<Family>(OLD_VALUES[i % 3]));
         std::string const* const value = i < 3 ? &NEW_VALUES[i] : nullptr;
         std::string const told = replace(value);
         if (told == CANNOT_MOUNT) {
@@ -421,7 +372,7 @@ void checkReplacements(Place const& place, Replace replace) {
             return;
         }
         CHECK(told == NOTHING);
-        CHECK(place.bytes() == (i < 3 ? Family::bytes(0, 1, *value) : ""));
+        CHECK(place.bytes() == (i < 3 ? one<Family>(*value) : ""));
     }
 }
 

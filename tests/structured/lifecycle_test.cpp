@@ -11,40 +11,13 @@
 #include <thread>
 #include <type_traits>
 #include <utility>
+#include <vector>
 
+#include "structured/fixture.h"
 #include "support/slots.h"
-#include "support/structuredfile.h"
 #include "support/subprocess.h"
-#include "support/tempdir.h"
-#include "support/throws.h"
 
-using test::complaint;
-using test::Flat;
-using test::holds;
-using test::isWhole;
-using test::messageOf;
-using test::NOT_OPENED;
-using test::NOTHING;
-using test::Place;
-using test::readFile;
-using test::Records;
-using test::Sectioned;
-using test::sizeOf;
-using test::slotOf;
-
-namespace {
-
-unsigned long const READ = Koru::File::READ;
-unsigned long const WRITE = Koru::File::WRITE;
-unsigned long const READ_WRITE = READ | WRITE;
-
-/// Whether the object is as `close` leaves it.
-template <class Family>
-bool isClosedAndEmpty(typename Family::File& file) {
-    return !file.is_open() && file.getMode() == 0 && sizeOf<Family>(file) == 0;
-}
-
-} // namespace
+using namespace structured;
 
 TEST_CASE_TEMPLATE("a structured file is a file, a stream and not copyable", Family, Sectioned,
                    Flat, Records) {
@@ -59,9 +32,7 @@ TEST_CASE_TEMPLATE("a structured file is a file, a stream and not copyable", Fam
     static_assert(!std::is_copy_assignable<File>::value, "");
     static_assert(std::has_virtual_destructor<File>::value, "");
     static_assert(std::is_nothrow_destructible<File>::value, "");
-    Place const place;
-    File file(place.path());
-    file.open(WRITE);
+    OwnFile<Family> const file("", WRITE);
     std::fstream const& stream = file;
     CHECK(stream.is_open());
 }
@@ -79,7 +50,7 @@ TEST_CASE_TEMPLATE(
     "the virtual operations keep their order behind the two entries of the destructor", Family,
     Sectioned, Flat, Records) {
     using File = typename Family::File;
-    CHECK(test::slotOfOpen<File>() == 2);
+    CHECK(slotOfOpen<File>() == 2);
     CHECK(slotOf(&File::close) == 3);
     CHECK(slotOf(&File::synchronize) == 4);
     CHECK(slotOf(&File::getMode) == 5);
@@ -90,56 +61,51 @@ TEST_CASE_TEMPLATE(
 
 TEST_CASE_TEMPLATE("a new object is closed, has mode 0, no entries and the path's name", Family,
                    Sectioned, Flat, Records) {
-    typename Family::File nameless;
-    CHECK(isClosedAndEmpty<Family>(nameless));
-    CHECK(nameless.getName().empty());
-    Place const place;
-    Koru::File::Path const path(place.path());
-    typename Family::File file(path);
-    CHECK(isClosedAndEmpty<Family>(file));
+    OwnFile<Family> file;
+    CHECK(file.isClosedAndEmpty());
     CHECK(file.good());
-    CHECK((file.getName() == static_cast<std::wstring>(path)));
+    CHECK((file.getName() == wide(file.place.path())));
     CHECK(Family::value(file, 0).empty());
-    CHECK(!place.exists());
+    CHECK(!file.place.exists());
+    typename Family::File nameless;
+    CHECK(!nameless.is_open());
+    CHECK(nameless.getMode() == 0);
+    CHECK(nameless.getName().empty());
+    CHECK(sizeOf<Family>(nameless) == 0);
 }
 
 TEST_CASE_TEMPLATE("opening a missing file fails for reading and creates it for writing", Family,
                    Sectioned, Flat, Records) {
-    Place const place;
-    typename Family::File file(place.path());
+    OwnFile<Family> file;
     CHECK(complaint([&] { file.open(READ); }) == NOT_OPENED);
     CHECK(!file.is_open());
-    CHECK(!place.exists());
+    CHECK(!file.place.exists());
     file.open(READ_WRITE);
     CHECK(file.is_open());
-    CHECK(place.bytes() == "");
+    CHECK(file.bytes() == "");
     file.close();
-    CHECK(place.bytes() == "");
-    std::filesystem::remove(place.path());
+    CHECK(file.bytes() == "");
+    std::filesystem::remove(file.place.path());
     file.open(WRITE);
-    CHECK(place.bytes() == "");
+    CHECK(file.bytes() == "");
 }
 
 TEST_CASE_TEMPLATE("a mode without reading and writing is refused", Family, Sectioned, Flat,
                    Records) {
-    Place const place;
-    place.write("anything");
-    typename Family::File file(place.path());
+    OwnFile<Family> file("anything");
     for (unsigned long const mode : {0UL, 4UL, 0UL + Koru::File::BINARY}) {
         CHECK(complaint([&] { file.open(mode); }) == NOT_OPENED);
-        CHECK(!file.is_open());
-        CHECK(file.getMode() == 0);
+        CHECK(file.isClosedAndEmpty());
     }
-    CHECK(place.bytes() == "anything");
+    CHECK(file.bytes() == "anything");
 }
 
 TEST_CASE_TEMPLATE("an open that fails leaves the entries as they were", Family, Sectioned, Flat,
                    Records) {
-    Place const place;
-    typename Family::File file(place.path());
-    Family::set(file, 0);
+    OwnFile<Family> file;
+    file.put(0);
     CHECK(complaint([&] { file.open(READ); }) == NOT_OPENED);
-    CHECK(holds<Family>(file, 0, 1));
+    CHECK(file.has(1));
     CHECK(file.getMode() == 0);
     typename Family::File nameless;
     Family::set(nameless, 0);
@@ -148,19 +114,17 @@ TEST_CASE_TEMPLATE("an open that fails leaves the entries as they were", Family,
 }
 
 TEST_CASE_TEMPLATE("open discards what was held", Family, Sectioned, Flat, Records) {
-    Place const place;
-    place.write(Family::bytes(0, 1));
-    typename Family::File file(place.path());
-    Family::set(file, 5);
+    OwnFile<Family> file(one<Family>());
+    file.put(5);
     file.open(READ_WRITE);
-    CHECK(holds<Family>(file, 0, 1));
+    CHECK(file.has(1));
     file.close();
-    CHECK(place.bytes() == Family::bytes(0, 1));
-    Family::set(file, 5);
+    CHECK(file.bytes() == one<Family>());
+    file.put(5);
     file.open(WRITE);
-    CHECK(sizeOf<Family>(file) == 0);
+    CHECK(file.count() == 0);
     file.close();
-    CHECK(place.bytes() == "");
+    CHECK(file.bytes() == "");
 }
 
 TEST_CASE_TEMPLATE("the operations work on an object that was never opened", Family, Sectioned,
@@ -176,86 +140,76 @@ TEST_CASE_TEMPLATE("the operations work on an object that was never opened", Fam
 
 TEST_CASE_TEMPLATE("changes without the write bit vanish at close and the file stays untouched",
                    Family, Sectioned, Flat, Records) {
-    Place const place;
-    std::string const bytes = Family::untidyBytes();
-    place.write(bytes);
-    auto const time = std::filesystem::last_write_time(place.path());
-    typename Family::File file(place.path());
+    OwnFile<Family> file(Family::untidyBytes());
+    auto const time = std::filesystem::last_write_time(file.place.path());
     file.open(READ);
-    Family::set(file, 0, "changed");
-    Family::add(file, 1);
-    CHECK(messageOf<std::exception>([&] { file.close(); }) == NOTHING);
-    CHECK(isClosedAndEmpty<Family>(file));
+    file.put(0, "changed");
+    file.put(1);
+    CHECK(complaint([&] { file.close(); }) == NOTHING);
+    CHECK(file.isClosedAndEmpty());
     {
-        typename Family::File other(place.path());
+        typename Family::File other(file.place.path());
         other.open(READ);
         CHECK(holds<Family>(other, 0, 1));
         Family::add(other, 1); // which vanishes with the destructor
     }
-    CHECK(place.bytes() == bytes);
-    CHECK(std::filesystem::last_write_time(place.path()) == time);
+    CHECK(file.bytes() == Family::untidyBytes());
+    CHECK(std::filesystem::last_write_time(file.place.path()) == time);
 }
 
 TEST_CASE_TEMPLATE("a file open for writing is written anew at close, changed or not", Family,
                    Sectioned, Flat, Records) {
-    Place const place;
-    place.write(Family::untidyBytes());
-    typename Family::File file(place.path());
+    OwnFile<Family> file(Family::untidyBytes());
     for (int i = 0; i < 2; ++i) {
         file.open(READ_WRITE);
         file.close();
-        CHECK(isClosedAndEmpty<Family>(file));
-        CHECK(place.bytes() == Family::bytes(0, 1));
+        CHECK(file.isClosedAndEmpty());
+        CHECK(file.bytes() == one<Family>());
     }
 }
 
 TEST_CASE_TEMPLATE("opening for writing alone begins empty and replaces the whole file", Family,
                    Sectioned, Flat, Records) {
-    Place const place;
-    place.write(Family::bytes(5, 9));
-    typename Family::File file(place.path());
-    file.open(WRITE);
-    CHECK(sizeOf<Family>(file) == 0);
-    CHECK(place.bytes() == "");
-    Family::set(file, 0);
-    CHECK(place.bytes() == "");
+    OwnFile<Family> file(Family::bytes(5, 9), WRITE);
+    CHECK(file.count() == 0);
+    CHECK(file.bytes() == "");
+    file.put(0);
+    CHECK(file.bytes() == "");
     file.close();
-    CHECK(place.bytes() == Family::bytes(0, 1));
-    CHECK(isClosedAndEmpty<Family>(file));
+    CHECK(file.bytes() == one<Family>());
+    CHECK(file.isClosedAndEmpty());
     file.open(WRITE);
     file.close();
-    CHECK(place.bytes() == "");
+    CHECK(file.bytes() == "");
 }
 
 TEST_CASE_TEMPLATE("the mode keeps the bits without a meaning", Family, Sectioned, Flat, Records) {
-    Place const place;
-    typename Family::File file(place.path());
+    OwnFile<Family> file;
     for (unsigned long const mode :
          {WRITE, READ_WRITE, READ, READ_WRITE | 0x40UL, READ_WRITE | Koru::File::BINARY}) {
         CAPTURE(mode);
         file.open(mode);
-        CHECK(file.getMode() == (mode | Family::ADDED_MODE));
-        Family::set(file, 0);
+        CHECK(file.isOpen(mode));
+        file.put(0);
         file.synchronize();
-        CHECK(file.getMode() == (mode | Family::ADDED_MODE));
-        if ((mode & READ_WRITE) == READ_WRITE) CHECK(holds<Family>(file, 0, 1));
+        CHECK(file.isOpen(mode));
+        if ((mode & READ_WRITE) == READ_WRITE) CHECK(file.has(1));
         file.close();
-        CHECK(file.getMode() == 0);
+        CHECK(file.isClosedAndEmpty());
     }
-    CHECK(place.bytes() == Family::bytes(0, 1));
+    CHECK(file.bytes() == one<Family>());
 }
 
 TEST_CASE_TEMPLATE("a file may be opened and closed again and again", Family, Sectioned, Flat,
                    Records) {
-    Place const place;
-    typename Family::File file(place.path());
+    OwnFile<Family> file;
     for (int i = 0; i < 20; ++i) {
         file.open(READ_WRITE);
-        CHECK(holds<Family>(file, 0, i));
-        Family::add(file, i);
+        CHECK(file.has(i));
+        file.put(i);
         file.close();
     }
-    CHECK(isWhole<Family>(place.bytes(), 0, 20));
+    CHECK(isWhole<Family>(file.bytes(), 0, 20));
 }
 
 TEST_CASE_TEMPLATE("closing or destroying an object that was never opened touches no file", Family,
@@ -264,8 +218,9 @@ TEST_CASE_TEMPLATE("closing or destroying an object that was never opened touche
     {
         typename Family::File file(place.path());
         Family::set(file, 0);
-        CHECK(messageOf<std::exception>([&] { file.close(); }) == NOTHING);
-        CHECK(isClosedAndEmpty<Family>(file));
+        CHECK(complaint([&] { file.close(); }) == NOTHING);
+        CHECK(sizeOf<Family>(file) == 0);
+        CHECK(file.getMode() == 0);
         CHECK(file.fail());
         // The destructor destroys these, which the address sanitizer would tell.
         for (int i = 0; i < 200; ++i) Family::set(file, i, std::string(1000, 'x'));
@@ -274,13 +229,12 @@ TEST_CASE_TEMPLATE("closing or destroying an object that was never opened touche
     place.write("old");
     { typename Family::File const file(place.path()); }
     CHECK(place.bytes() == "old");
-    { typename Family::File const nameless; }
     typename Family::File nameless;
     Family::set(nameless, 0);
     nameless.synchronize();
     CHECK(holds<Family>(nameless, 0, 1));
-    CHECK(messageOf<std::exception>([&] { nameless.close(); }) == NOTHING);
-    CHECK(isClosedAndEmpty<Family>(nameless));
+    CHECK(complaint([&] { nameless.close(); }) == NOTHING);
+    CHECK(sizeOf<Family>(nameless) == 0);
 }
 
 TEST_CASE_TEMPLATE("an object whose open failed touches no file when it is destroyed", Family,
@@ -296,60 +250,46 @@ TEST_CASE_TEMPLATE("an object whose open failed touches no file when it is destr
 }
 
 TEST_CASE_TEMPLATE("closing twice is harmless", Family, Sectioned, Flat, Records) {
-    Place const place;
-    typename Family::File file(place.path());
-    file.open(READ_WRITE);
-    Family::set(file, 0);
+    OwnFile<Family> file("", READ_WRITE);
+    file.put(0);
     file.close();
-    Family::set(file, 1);
-    CHECK(messageOf<std::exception>([&] { file.close(); }) == NOTHING);
-    CHECK(isClosedAndEmpty<Family>(file));
-    CHECK(place.bytes() == Family::bytes(0, 1));
+    file.put(1);
+    CHECK(complaint([&] { file.close(); }) == NOTHING);
+    CHECK(file.isClosedAndEmpty());
+    CHECK(file.bytes() == one<Family>());
 }
 
 TEST_CASE_TEMPLATE("the destructor writes a file that is open for writing", Family, Sectioned, Flat,
                    Records) {
     using File = typename Family::File;
     Place const place;
-    for (unsigned long const mode : {WRITE, READ_WRITE}) {
-        place.write("");
-        {
-            File file(place.path());
-            file.open(mode);
-            Family::set(file, 0);
-        }
-        CHECK(place.bytes() == Family::bytes(0, 1));
-    }
-    {
-        File file(place.path());
-        file.open(READ);
-        Family::set(file, 0, "changed");
-    }
-    CHECK(place.bytes() == Family::bytes(0, 1));
+    auto const destroyed = [&](unsigned long mode, std::string const& value) {
+        auto* const file = new File(place.path());
+        std::unique_ptr<std::iostream> stream(file);
+        file->open(mode);
+        Family::set(*file, 0, value);
+        stream.reset();
+        return place.bytes();
+    };
+    CHECK(destroyed(WRITE, "first") == one<Family>("first"));
+    CHECK(destroyed(READ_WRITE, "second") == one<Family>("second"));
+    CHECK(destroyed(READ, "third") == one<Family>("second"));
     { // Not one that was closed, whatever it holds.
         File file(place.path());
         file.open(READ_WRITE);
         file.close();
         Family::set(file, 5);
     }
-    CHECK(place.bytes() == Family::bytes(0, 1));
-    {
-        std::unique_ptr<Koru::File> const file(new File(place.path()));
-        file->open(WRITE);
-    }
-    CHECK(place.bytes() == "");
-    {
-        auto* const file = new File(place.path());
-        std::unique_ptr<std::iostream> const stream(file);
-        file->open(WRITE);
-        Family::set(*file, 0, "deleted as a stream");
-    }
-    CHECK(place.bytes() == Family::bytes(0, 1, "deleted as a stream"));
+    CHECK(place.bytes() == one<Family>("second"));
+    std::unique_ptr<Koru::File> file(new File(place.path()));
+    file->open(READ_WRITE);
+    place.write("");
+    file.reset();
+    CHECK(place.bytes() == one<Family>("second"));
 }
 
-TEST_CASE_TEMPLATE(
-    "the destructor of a settings file closes always, of a record file if it is open", Family,
-    Sectioned, Flat, Records) {
+TEST_CASE_TEMPLATE("the destructor closes a settings file always, a record file when it is open",
+                   Family, Sectioned, Flat, Records) {
     Place const place;
     place.write("old");
     {
@@ -357,7 +297,7 @@ TEST_CASE_TEMPLATE(
         file.setMode(WRITE);
         Family::set(file, 0);
     }
-    CHECK(place.bytes() == (Family::CLOSES_ALWAYS ? Family::bytes(0, 1) : "old"));
+    CHECK(place.bytes() == (Family::CLOSES_ALWAYS ? one<Family>() : "old"));
 }
 
 namespace {
@@ -397,137 +337,123 @@ TEST_CASE_TEMPLATE("synchronize reaches overrides, and the destructor calls the 
         Family::set(file, 0);
         file.synchronize();
         CHECK(calls == all);
-        CHECK(place.bytes() == Family::bytes(0, 1));
+        CHECK(place.bytes() == one<Family>());
         Family::set(file, 0, "changed");
     }
     CHECK(calls == all);
-    CHECK(place.bytes() == Family::bytes(0, 1, "changed"));
+    CHECK(place.bytes() == one<Family>("changed"));
 }
 
 TEST_CASE_TEMPLATE("synchronize writes back and reads again", Family, Sectioned, Flat, Records) {
-    Place const place;
-    place.write(Family::untidyBytes());
-    typename Family::File file(place.path());
-    file.open(READ_WRITE);
-    Family::add(file, 1);
+    OwnFile<Family> file(Family::untidyBytes(), READ_WRITE);
+    file.put(1);
     file.synchronize();
-    CHECK(file.is_open());
-    CHECK(file.getMode() == (READ_WRITE | Family::ADDED_MODE));
-    CHECK(holds<Family>(file, 0, 2));
-    CHECK(isWhole<Family>(place.bytes(), 0, 2));
+    CHECK(file.isOpen(READ_WRITE));
+    CHECK(file.has(2));
+    CHECK(isWhole<Family>(file.bytes(), 0, 2));
 }
 
 TEST_CASE_TEMPLATE(
     "synchronize of a file open for reading drops changes and reads what is there now", Family,
     Sectioned, Flat, Records) {
-    Place const place;
-    place.write(Family::bytes(0, 1));
-    typename Family::File file(place.path());
-    file.open(READ);
-    Family::set(file, 0, "mine");
-    Family::add(file, 1);
-    place.write(Family::bytes(0, 1, "there now"));
+    OwnFile<Family> file(one<Family>(), READ);
+    file.put(0, "mine");
+    file.put(1);
+    file.place.write(one<Family>("there now"));
     file.synchronize();
-    CHECK(holds<Family>(file, 0, 1, "there now"));
-    CHECK(file.getMode() == (READ | Family::ADDED_MODE));
-    CHECK(place.bytes() == Family::bytes(0, 1, "there now"));
+    CHECK(file.has(1, "there now"));
+    CHECK(file.isOpen(READ));
+    CHECK(file.bytes() == one<Family>("there now"));
 }
 
 TEST_CASE_TEMPLATE("synchronize of a file open for writing alone leaves it and the memory empty",
                    Family, Sectioned, Flat, Records) {
     // Intended: reopening for writing empties the file that was just written.
-    Place const place;
-    typename Family::File file(place.path());
-    file.open(WRITE);
-    Family::set(file, 0);
+    OwnFile<Family> file("", WRITE);
+    file.put(1);
     file.synchronize();
-    CHECK(file.getMode() == (WRITE | Family::ADDED_MODE));
-    CHECK(sizeOf<Family>(file) == 0);
-    CHECK(place.bytes() == "");
-    Family::set(file, 1);
+    CHECK(file.isOpen(WRITE));
+    CHECK(file.count() == 0);
+    CHECK(file.bytes() == "");
+    file.put(0);
     file.close();
-    CHECK(place.bytes() == Family::bytes(1, 2));
+    CHECK(file.bytes() == one<Family>());
 }
 
 TEST_CASE_TEMPLATE("synchronize leaves a closed file and what it holds as they are", Family,
                    Sectioned, Flat, Records) {
-    Place const place;
-    typename Family::File file(place.path());
-    Family::set(file, 0);
+    OwnFile<Family> file;
+    file.put(0);
     file.synchronize();
-    CHECK(holds<Family>(file, 0, 1));
+    CHECK(file.has(1));
     CHECK(!file.is_open());
-    CHECK(!place.exists());
+    CHECK(!file.place.exists());
 }
 
 TEST_CASE_TEMPLATE("setMode decides what the next close does", Family, Sectioned, Flat, Records) {
-    Place const place;
-    place.write(Family::untidyBytes());
-    typename Family::File file(place.path());
+    OwnFile<Family> file(Family::untidyBytes());
     SUBCASE("writing allowed later") {
         file.open(READ);
-        Family::set(file, 0, "new");
+        file.put(0, "new");
         file.setMode(READ_WRITE);
         file.synchronize();
-        CHECK(place.bytes() == Family::bytes(0, 1, "new"));
-        CHECK(file.getMode() == (READ_WRITE | Family::ADDED_MODE));
-        CHECK(holds<Family>(file, 0, 1, "new"));
+        CHECK(file.bytes() == one<Family>("new"));
+        CHECK(file.isOpen(READ_WRITE));
+        CHECK(file.has(1, "new"));
     }
     SUBCASE("writing no longer allowed") {
         file.open(READ_WRITE);
-        Family::set(file, 0, "new");
+        file.put(0, "new");
         file.setMode(READ);
         file.synchronize();
-        CHECK(file.getMode() == (READ | Family::ADDED_MODE));
-        CHECK(holds<Family>(file, 0, 1));
+        CHECK(file.isOpen(READ));
+        CHECK(file.has(1));
         file.close();
-        CHECK(place.bytes() == Family::untidyBytes());
+        CHECK(file.bytes() == Family::untidyBytes());
     }
     SUBCASE("writing alone") {
         file.open(READ);
         file.setMode(WRITE);
         file.close();
-        CHECK(place.bytes() == Family::bytes(0, 1));
+        CHECK(file.bytes() == one<Family>());
     }
     SUBCASE("neither") {
         file.open(READ_WRITE);
-        Family::set(file, 0, "new");
+        file.put(0, "new");
         file.setMode(0);
         CHECK(complaint([&] { file.synchronize(); }) == NOT_OPENED);
         CHECK(!file.is_open());
-        CHECK(place.bytes() == Family::untidyBytes());
+        CHECK(file.bytes() == Family::untidyBytes());
     }
     SUBCASE("writing, without the file ever opened") {
         file.setMode(READ_WRITE);
-        Family::set(file, 1);
+        file.put(0, "new");
         file.close();
-        CHECK(place.bytes() == Family::bytes(1, 2));
-        CHECK(isClosedAndEmpty<Family>(file));
+        CHECK(file.bytes() == one<Family>("new"));
+        CHECK(file.isClosedAndEmpty());
     }
 }
 
 TEST_CASE_TEMPLATE("opening an open file reads it again and changes the mode, but not the stream",
                    Family, Sectioned, Flat, Records) {
-    Place const place;
-    place.write(Family::bytes(0, 1));
-    typename Family::File file(place.path());
+    OwnFile<Family> file(one<Family>());
     SUBCASE("to read again") {
         file.open(READ_WRITE);
-        Family::add(file, 1);
+        file.put(1);
         file.open(READ);
-        CHECK(file.getMode() == (READ | Family::ADDED_MODE));
+        CHECK(file.isOpen(READ));
         CHECK(file.rdstate() == std::ios::eofbit);
-        CHECK(holds<Family>(file, 0, 1));
-        Family::add(file, 1);
+        CHECK(file.has(1));
+        file.put(1);
         file.close();
-        CHECK(place.bytes() == Family::bytes(0, 1));
+        CHECK(file.bytes() == one<Family>());
     }
     SUBCASE("to read again from the start, wherever the caller left the stream") {
         file.open(READ);
         file.clear();
         file.seekg(3);
         file.open(READ);
-        CHECK(holds<Family>(file, 0, 1));
+        CHECK(file.has(1));
     }
     SUBCASE("to read what the caller wrote through the stream") {
         file.open(READ_WRITE);
@@ -536,48 +462,44 @@ TEST_CASE_TEMPLATE("opening an open file reads it again and changes the mode, bu
         std::string const more = Family::bytes(1, 2);
         file.write(more.data(), static_cast<std::streamsize>(more.size()));
         file.open(READ_WRITE);
-        CHECK(holds<Family>(file, 0, 2));
+        CHECK(file.has(2));
     }
     SUBCASE("to write") {
         file.open(READ);
         file.open(WRITE);
-        CHECK(file.getMode() == (WRITE | Family::ADDED_MODE));
-        CHECK(sizeOf<Family>(file) == 0);
-        CHECK(place.bytes() == Family::bytes(0, 1)); // not emptied: it was not opened again
-        Family::set(file, 1);
+        CHECK(file.isOpen(WRITE));
+        CHECK(file.count() == 0);
+        CHECK(file.bytes() == one<Family>()); // not emptied: it was not opened again
+        file.put(0, "new");
         file.close();
-        CHECK(place.bytes() == Family::bytes(1, 2));
+        CHECK(file.bytes() == one<Family>("new"));
     }
     SUBCASE("to read what was opened for writing alone") {
         file.open(WRITE);
-        Family::add(file, 1);
+        file.put(1);
         // Intended: as if the file were empty.
-        CHECK(messageOf<std::exception>([&] { file.open(READ); }) == NOTHING);
-        CHECK(sizeOf<Family>(file) == 0);
+        CHECK(complaint([&] { file.open(READ); }) == NOTHING);
+        CHECK(file.count() == 0);
         file.close();
-        CHECK(place.bytes() == "");
+        CHECK(file.bytes() == "");
     }
     SUBCASE("with no mode at all") {
         file.open(READ_WRITE);
         file.open(0);
-        CHECK(file.is_open());
-        CHECK(file.getMode() == Family::ADDED_MODE);
-        CHECK(sizeOf<Family>(file) == 0);
+        CHECK(file.isOpen(0));
+        CHECK(file.count() == 0);
         file.close();
-        CHECK(place.bytes() == Family::bytes(0, 1));
+        CHECK(file.bytes() == one<Family>());
     }
 }
 
 TEST_CASE_TEMPLATE("open leaves the stream at the end of the file, where it can be used", Family,
                    Sectioned, Flat, Records) {
-    Place const place;
     for (std::string const& bytes : {Family::bytes(0, 2), Family::untidyBytes(), std::string()}) {
-        place.write(bytes);
         for (unsigned long const mode : {READ, READ_WRITE}) {
             CAPTURE(bytes.size());
             CAPTURE(mode);
-            typename Family::File file(place.path());
-            file.open(mode);
+            OwnFile<Family> file(bytes, mode);
             CHECK(file.rdstate() == std::ios::eofbit);
             file.clear();
             CHECK(file.tellg() == std::streampos(static_cast<std::streamoff>(bytes.size())));
@@ -585,135 +507,124 @@ TEST_CASE_TEMPLATE("open leaves the stream at the end of the file, where it can 
             std::string content(bytes.size(), ' ');
             CHECK(bool(file.read(&content[0], static_cast<std::streamsize>(content.size()))));
             CHECK(content == bytes);
-            file.setMode(READ); // nothing is to be written
         }
     }
-    typename Family::File other(place.path());
-    other.open(WRITE);
-    CHECK(other.good());
-    other.write("direct", 6).flush();
-    CHECK(place.bytes() == "direct");
-    other.close();
-    CHECK(place.bytes() == "");
+    OwnFile<Family> file("", WRITE);
+    CHECK(file.good());
+    file.write("direct", 6).flush();
+    CHECK(file.bytes() == "direct");
+    file.close();
+    CHECK(file.bytes() == "");
 }
 
 TEST_CASE_TEMPLATE("open and close clear what went wrong with the stream before", Family, Sectioned,
                    Flat, Records) {
-    Place const place;
-    typename Family::File file(place.path());
+    OwnFile<Family> file;
     CHECK(complaint([&] { file.open(READ); }) == NOT_OPENED);
     CHECK(file.fail());
     file.open(WRITE);
     for (std::ios::iostate const state :
          {std::ios::failbit, std::ios::badbit, std::ios::failbit | std::ios::badbit}) {
         CAPTURE(state);
-        Family::set(file, 0, "first");
+        file.put(0, "first");
         file.setstate(state);
-        CHECK(messageOf<std::exception>([&] { file.close(); }) == NOTHING);
-        CHECK(place.bytes() == Family::bytes(0, 1, "first"));
+        CHECK(complaint([&] { file.close(); }) == NOTHING);
+        CHECK(file.bytes() == one<Family>("first"));
         file.setstate(state);
         file.open(READ_WRITE);
         CHECK(file.rdstate() == std::ios::eofbit);
-        CHECK(holds<Family>(file, 0, 1, "first"));
-        Family::set(file, 0, "second");
+        CHECK(file.has(1, "first"));
+        file.put(0, "second");
         file.setstate(state);
         file.synchronize();
-        CHECK(place.bytes() == Family::bytes(0, 1, "second"));
-        CHECK(holds<Family>(file, 0, 1, "second"));
+        CHECK(file.bytes() == one<Family>("second"));
+        CHECK(file.has(1, "second"));
     }
 }
 
 TEST_CASE_TEMPLATE("the stream's formatting does not show in the file", Family, Sectioned, Flat,
                    Records) {
-    Place const place;
-    place.write(Family::untidyBytes());
-    typename Family::File file(place.path());
+    OwnFile<Family> file(Family::untidyBytes());
     file.width(30);
     file.fill('*');
     file.setf(std::ios::left | std::ios::unitbuf | std::ios::showbase);
     file.unsetf(std::ios::skipws);
     file.open(READ_WRITE);
-    CHECK(holds<Family>(file, 0, 1));
+    CHECK(file.has(1));
     file.width(30);
     file.close();
-    CHECK(place.bytes() == Family::bytes(0, 1));
+    CHECK(file.bytes() == one<Family>());
 }
 
 TEST_CASE_TEMPLATE("close deletes the old file and writes another in its place", Family, Sectioned,
                    Flat, Records) {
-    Place const place;
-    std::string const other = place.directory() / "other";
-    std::string const before = Family::bytes(0, 1, "old");
+    OwnFile<Family> file(one<Family>("old"));
+    std::string const path = file.place.path();
+    std::string const other = file.place.directory() / "other";
     mode_t const mask = ::umask(022);
     auto const replace = [&](auto meanwhile) {
-        typename Family::File file(place.path());
         file.open(READ_WRITE);
-        CHECK(holds<Family>(file, 0, 1, "old"));
-        Family::set(file, 0, "new");
+        CHECK(file.has(1, "old"));
+        file.put(0, "new");
         meanwhile();
         file.close();
-        CHECK(place.bytes() == Family::bytes(0, 1, "new"));
+        CHECK(file.bytes() == one<Family>("new"));
     };
-    place.write(before);
     SUBCASE("another name of the old file keeps the old content") {
-        std::filesystem::create_hard_link(place.path(), other);
+        std::filesystem::create_hard_link(path, other);
         replace([] {});
-        CHECK(readFile(other) == before);
+        CHECK(readFile(other) == one<Family>("old"));
     }
     SUBCASE("a link is replaced, not what it leads to") {
-        std::filesystem::rename(place.path(), other);
-        std::filesystem::create_symlink(other, place.path());
+        std::filesystem::rename(path, other);
+        std::filesystem::create_symlink(other, path);
         replace([] {});
-        CHECK(!std::filesystem::is_symlink(place.path()));
-        CHECK(readFile(other) == before);
+        CHECK(!std::filesystem::is_symlink(path));
+        CHECK(readFile(other) == one<Family>("old"));
     }
     SUBCASE("the new file has a new file's permissions") {
-        CHECK(::chmod(place.path().c_str(), 0600) == 0);
+        CHECK(::chmod(path.c_str(), 0600) == 0);
         replace([] {});
         struct stat status = {};
-        CHECK(::stat(place.path().c_str(), &status) == 0);
+        CHECK(::stat(path.c_str(), &status) == 0);
         CHECK((status.st_mode & 0777U) == 0644U);
     }
     SUBCASE("a file that was deleted meanwhile comes back") {
-        replace([&] { std::filesystem::remove(place.path()); });
+        replace([&] { std::filesystem::remove(path); });
     }
     SUBCASE("what another wrote meanwhile is lost") {
-        replace([&] { place.write(std::string(10000, 'x')); });
+        replace([&] { file.place.write(std::string(10000, 'x')); });
     }
     SUBCASE("an empty directory in its place is deleted too") {
         replace([&] {
-            std::filesystem::remove(place.path());
-            std::filesystem::create_directory(place.path());
+            std::filesystem::remove(path);
+            std::filesystem::create_directory(path);
         });
     }
     ::umask(mask);
 }
 
 TEST_CASE_TEMPLATE("a pipe is read to its end", Family, Sectioned, Flat, Records) {
-    Place const place;
-    REQUIRE(::mkfifo(place.path().c_str(), 0600) == 0);
-    CHECK(test::toldByChild([&] {
-              std::thread writer([&] { test::writeFile(place.path(), Family::bytes(0, 10000)); });
-              typename Family::File file(place.path());
+    OwnFile<Family> file;
+    REQUIRE(::mkfifo(file.place.path().c_str(), 0600) == 0);
+    CHECK(toldByChild([&] {
+              std::thread writer([&] { writeFile(file.place.path(), Family::bytes(0, 10000)); });
               file.open(READ);
               writer.join();
-              return holds<Family>(file, 0, 10000) ? "all of it" : "something else";
+              return file.has(10000) ? "all of it" : "something else";
           }) == "all of it");
-    CHECK(std::filesystem::is_fifo(place.path()));
+    CHECK(std::filesystem::is_fifo(file.place.path()));
 }
 
 TEST_CASE_TEMPLATE("results are copies that later changes do not touch", Family, Sectioned, Flat) {
-    Place const place;
-    place.write(Family::bytes(0, 2));
-    typename Family::File file(place.path());
-    file.open(READ_WRITE);
+    OwnFile<Family> file(Family::bytes(0, 2), READ_WRITE);
     std::vector<std::wstring> const keys = Family::keys(file);
     std::wstring const value = Family::value(file, 0);
-    Family::set(file, 0, "changed");
-    Family::remove(file, 1);
+    file.put(0, "changed");
+    file.drop(1);
     file.synchronize();
     file.close();
-    CHECK((keys == std::vector<std::wstring>{test::entryKey(0), test::entryKey(1)}));
+    CHECK((keys == std::vector<std::wstring>{entryKey(0), entryKey(1)}));
     CHECK((value == L"value"));
-    CHECK(place.bytes() == Family::bytes(0, 1, "changed"));
+    CHECK(file.bytes() == one<Family>("changed"));
 }

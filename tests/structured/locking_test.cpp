@@ -7,51 +7,20 @@
 
 #include <atomic>
 #include <cerrno>
-#include <chrono>
 #include <exception>
 #include <fstream>
-#include <memory>
 #include <string>
 #include <thread>
-#include <utility>
 #include <vector>
 
+#include "structured/fixture.h"
 #include "support/cancellation.h"
-#include "support/structuredfile.h"
 #include "support/subprocess.h"
 #include "support/systemcalls.h"
-#include "support/tempdir.h"
-#include "support/throws.h"
 
-using test::Call;
-using test::endsCancelled;
-using test::FailingCall;
-using test::Flat;
-using test::holds;
-using test::messageOf;
-using test::Operation;
-using test::Place;
-using test::Records;
-using test::Sectioned;
-using test::toldByChild;
+using namespace structured;
 
 namespace {
-
-unsigned long const READ = Koru::File::READ;
-unsigned long const WRITE = Koru::File::WRITE;
-unsigned long const READ_WRITE = READ | WRITE;
-
-/// A file with entry 0, open for reading and writing.
-template <class Family>
-struct OpenFile {
-    Place place;
-    std::unique_ptr<typename Family::File> file;
-    OpenFile() {
-        place.write(Family::bytes(0, 1));
-        file = std::make_unique<typename Family::File>(place.path());
-        file->open(READ_WRITE);
-    }
-};
 
 /// Every operation that takes the lock, on a file whose path can be opened.
 template <class Family>
@@ -73,35 +42,52 @@ std::vector<Operation<typename Family::File>> allOperations() {
 template <class Family, class Action>
 std::string lockAfter(Action action) {
     return toldByChild([&] {
-        OpenFile<Family> open;
+        OwnFile<Family> file(one<Family>(), READ_WRITE);
         std::string text;
         try {
-            action(*open.file);
+            action(file);
         } catch (std::exception const& e) {
             text = e.what() + std::string(", ");
         }
-        std::thread([&] { Family::keys(*open.file); }).join();
-        open.file->exceptions(std::ios::goodbit);
-        open.file->setMode(0); // the destructor has nothing to write
+        std::thread([&] { Family::keys(file); }).join();
+        file.exceptions(std::ios::goodbit);
+        file.setMode(0); // the destructor has nothing to write
         return text + "free";
     });
 }
 
-/// Runs the callable in a thread whose cancellation is already asked for.
-template <class Callable>
-bool endsCancelledFromTheStart(Callable callable) {
+/// A step on a thread of its own.
+class OtherThread {
+public:
+    template <class Step>
+    explicit OtherThread(Step step)
+        : thread_([this, step] {
+              step();
+              done_ = true;
+          }) {}
+
+    /// Whether the step is kept waiting.
+    bool waits() const {
+        ::usleep(20000);
+        return !done_;
+    }
+    void join() { thread_.join(); }
+
+private:
+    std::atomic<bool> done_{false};
+    std::thread thread_;
+};
+
+/// Runs a step in a thread whose cancellation was asked for before it.
+template <class Step, class Meanwhile>
+bool cancelledIn(Step step, Meanwhile meanwhile) {
     return endsCancelled(
         [&] {
             ::pthread_cancel(::pthread_self());
-            callable();
+            step();
             ::pthread_testcancel();
         },
-        [](pthread_t) {});
-}
-
-void cancelSoon(pthread_t thread) {
-    ::usleep(20000);
-    ::pthread_cancel(thread);
+        [&](pthread_t) { meanwhile(); });
 }
 
 } // namespace
@@ -145,41 +131,30 @@ TEST_CASE_TEMPLATE("every exception leaves the lock free", Family, Sectioned, Fl
 TEST_CASE_TEMPLATE("stream exceptions that a caller enabled leave the lock free", Family, Sectioned,
                    Flat, Records) {
     using File = typename Family::File;
-    std::string const reading = lockAfter<Family>([](File& f) {
-        f.clear();
-        f.exceptions(std::ios::badbit | std::ios::failbit | std::ios::eofbit);
-        f.synchronize();
-    });
-    CAPTURE(reading);
-    CHECK(reading.size() >= 4);
-    CHECK(reading.substr(reading.size() - 4) == "free");
-    std::string const writing = lockAfter<Family>([](File& f) {
-        f.clear();
-        f.exceptions(std::ios::badbit | std::ios::failbit);
-        FailingCall const fault(Call::WRITE, ENOSPC, 0, FailingCall::FOR_EVER);
-        f.close();
-    });
-    CAPTURE(writing);
-    CHECK(writing != "free");
-    CHECK(writing.substr(writing.size() - 4) == "free");
+    for (bool const fails : {false, true}) {
+        std::string const result = lockAfter<Family>([fails](File& f) {
+            f.clear();
+            std::ios::iostate const end = fails ? std::ios::goodbit : std::ios::eofbit;
+            f.exceptions(std::ios::badbit | std::ios::failbit | end);
+            FailingCall const fault(Call::WRITE, ENOSPC, fails ? 0 : -1, FailingCall::FOR_EVER);
+            fails ? f.close() : f.synchronize();
+        });
+        CAPTURE(result);
+        CHECK(result.size() > 4);
+        CHECK(result.substr(result.size() - 4) == "free");
+    }
 }
 
 TEST_CASE_TEMPLATE("every operation waits while another thread holds the lock", Family, Sectioned,
                    Flat, Records) {
     for (auto const& operation : allOperations<Family>()) {
         CAPTURE(operation.label);
-        OpenFile<Family> const open;
-        CHECK(open.file->lock());
-        std::atomic<bool> done{false};
-        std::thread other([&] {
-            operation.run(*open.file);
-            done = true;
-        });
-        std::this_thread::sleep_for(std::chrono::milliseconds(20));
-        CHECK(!done);
-        CHECK(open.file->unlock());
+        OwnFile<Family> file(one<Family>(), READ_WRITE);
+        CHECK(file.lock());
+        OtherThread other([&] { operation.run(file); });
+        CHECK(other.waits());
+        CHECK(file.unlock());
         other.join();
-        CHECK(done);
     }
 }
 
@@ -187,57 +162,46 @@ TEST_CASE_TEMPLATE("every operation works for the thread that holds the lock", F
                    Flat, Records) {
     for (auto const& operation : allOperations<Family>()) {
         CAPTURE(operation.label);
-        OpenFile<Family> const open;
-        CHECK(open.file->lock());
-        CHECK(messageOf<std::exception>([&] { operation.run(*open.file); }) == test::NOTHING);
-        CHECK(open.file->unlock());
+        OwnFile<Family> file(one<Family>(), READ_WRITE);
+        CHECK(file.lock());
+        CHECK(messageOf<std::exception>([&] { operation.run(file); }) == NOTHING);
+        CHECK(file.unlock());
     }
 }
 
 TEST_CASE_TEMPLATE("the destructor waits while another thread holds the lock", Family, Sectioned,
                    Flat, Records) {
-    OpenFile<Family> open;
-    Family::set(*open.file, 0, "new");
-    CHECK(open.file->lock());
-    std::atomic<bool> done{false};
-    auto* const file = open.file.release();
-    std::thread other([&] {
-        delete file;
-        done = true;
-    });
-    std::this_thread::sleep_for(std::chrono::milliseconds(20));
-    CHECK(!done);
-    CHECK(open.place.bytes() == Family::bytes(0, 1));
+    Place const place;
+    auto* const file = new typename Family::File(place.path());
+    file->open(WRITE);
+    Family::set(*file, 0);
+    CHECK(file->lock());
+    OtherThread other([file] { delete file; });
+    CHECK(other.waits());
+    CHECK(place.bytes() == "");
     file->unlock();
     other.join();
-    CHECK(open.place.bytes() == Family::bytes(0, 1, "new"));
+    CHECK(place.bytes() == one<Family>());
 }
 
 TEST_CASE_TEMPLATE("the lock is held across the whole read of open", Family, Sectioned, Flat,
                    Records) {
     // The pipe keeps open reading until the test has seen that the lock is taken.
-    Place const place;
-    REQUIRE(::mkfifo(place.path().c_str(), 0600) == 0);
     CHECK(toldByChild([&] {
-              typename Family::File file(place.path());
-              std::thread reader([&] { file.open(READ); });
-              std::ofstream pipe(place.path()); // returns when the reader has opened it
-              std::string const first = Family::bytes(0, 1);
-              pipe << first << std::flush;
-              std::atomic<bool> got{false};
+              OwnFile<Family> file;
+              if (::mkfifo(file.place.path().c_str(), 0600) != 0) return "no pipe";
+              OtherThread reader([&] { file.open(READ); });
+              std::ofstream pipe(file.place.path()); // returns when the reader has opened it
+              pipe << one<Family>() << std::flush;
               bool all = false;
-              std::thread other([&] {
-                  all = holds<Family>(file, 0, 2);
-                  got = true;
-              });
-              ::usleep(30000);
-              bool const early = got;
-              pipe << Family::bytes(0, 2).substr(first.size());
+              OtherThread other([&] { all = file.has(2); });
+              bool const late = other.waits();
+              pipe << Family::bytes(0, 2).substr(one<Family>().size());
               pipe.close();
               reader.join();
               other.join();
-              return std::string(early ? "early" : "late") + (all ? ", all" : ", not all");
-          }) == "late, all");
+              return late && all ? "it waits for all" : "it does not wait";
+          }) == "it waits for all");
 }
 
 TEST_CASE_TEMPLATE("the lock is held across the whole write-back of close and synchronize", Family,
@@ -245,40 +209,32 @@ TEST_CASE_TEMPLATE("the lock is held across the whole write-back of close and sy
     for (bool const synchronize : {false, true}) {
         CAPTURE(synchronize);
         CHECK(toldByChild([&] {
-                  OpenFile<Family> const open;
-                  test::writesWait = true;
-                  std::thread writer(
-                      [&] { synchronize ? open.file->synchronize() : open.file->close(); });
-                  while (!test::aWriteWaits) ::usleep(1000);
-                  std::atomic<bool> got{false};
-                  std::size_t size = 0;
-                  std::thread other([&] {
-                      size = test::sizeOf<Family>(*open.file);
-                      got = true;
-                  });
-                  ::usleep(30000);
-                  bool const early = got;
-                  test::writesWait = false;
+                  OwnFile<Family> file(one<Family>(), READ_WRITE);
+                  writesWait = true;
+                  OtherThread writer([&] { synchronize ? file.synchronize() : file.close(); });
+                  while (!aWriteWaits) ::usleep(1000);
+                  std::size_t count = 9;
+                  OtherThread other([&] { count = file.count(); });
+                  bool const late = other.waits();
+                  writesWait = false;
                   writer.join();
                   other.join();
-                  return std::string(early ? "early, " : "late, ") + std::to_string(size);
+                  return (late ? "late, " : "early, ") + std::to_string(count);
               }) == (synchronize ? "late, 1" : "late, 0"));
     }
 }
 
 TEST_CASE_TEMPLATE("edits of several threads are not lost while others synchronize", Family,
                    Sectioned, Flat, Records) {
-    Place const place;
-    typename Family::File file(place.path());
-    file.open(READ_WRITE);
+    OwnFile<Family> file("", READ_WRITE);
     int const count = 60;
     std::vector<std::thread> threads;
-    for (int t = 0; t < 3; ++t) {
-        threads.emplace_back([&file, t] {
-            for (int i = t * count; i < (t + 1) * count; ++i) {
-                Family::set(file, i, "value of " + std::to_string(i));
-                Family::add(file, 1000 + i);
-                Family::remove(file, 1000 + i);
+    for (int first = 0; first < 3 * count; first += count) {
+        threads.emplace_back([&file, first] {
+            for (int i = first; i < first + count; ++i) {
+                file.put(i, "value of " + std::to_string(i));
+                file.put(1000 + i);
+                file.drop(1000 + i);
             }
         });
     }
@@ -286,11 +242,11 @@ TEST_CASE_TEMPLATE("edits of several threads are not lost while others synchroni
         for (int i = 0; i < 15; ++i) file.synchronize();
     });
     threads.emplace_back([&file] {
-        for (int i = 0; i < 15; ++i) Family::keys(file);
+        for (int i = 0; i < 15; ++i) file.count();
     });
     for (std::thread& thread : threads) thread.join();
     file.synchronize();
-    CHECK(holds<Family>(file, 0, 3 * count, "value of " + std::to_string(3 * count - 1)));
+    CHECK(file.has(3 * count, "value of 179"));
     for (int i = 0; i < 3 * count; ++i) {
         CHECK((Family::value(file, i) == L"value of " + std::to_wstring(i)));
     }
@@ -302,28 +258,24 @@ TEST_CASE_TEMPLATE("the destructor completes its work in a thread that is being 
     for (bool const lockIsHeld : {false, true}) {
         CAPTURE(lockIsHeld);
         Place const place;
-        place.write(Family::bytes(0, 1));
         CHECK(toldByChild([&] {
                   auto* const file = new typename Family::File(place.path());
                   file->open(READ_WRITE);
                   Family::set(*file, 0, value);
                   if (lockIsHeld) file->lock();
-                  std::atomic<bool> survived{false};
-                  bool const cancelled = endsCancelled(
+                  bool survived = false;
+                  bool const cancelled = cancelledIn(
                       [&] {
-                          ::pthread_cancel(::pthread_self());
                           delete file;
                           survived = true;
-                          ::pthread_testcancel();
                       },
-                      [&](pthread_t) {
+                      [&] {
                           ::usleep(20000);
                           if (lockIsHeld) file->unlock();
                       });
-                  return std::string(survived ? "survived, " : "interrupted, ") +
-                         (cancelled ? "cancelled after it" : "not cancelled");
-              }) == "survived, cancelled after it");
-        CHECK((place.bytes() == Family::bytes(0, 1, value)));
+                  return survived && cancelled ? "cancelled after it" : "interrupted";
+              }) == "cancelled after it");
+        CHECK((place.bytes() == one<Family>(value)));
     }
 }
 
@@ -331,37 +283,36 @@ TEST_CASE_TEMPLATE("a thread cancelled in an operation leaves the lock free and 
                    Family, Sectioned, Flat, Records) {
     using File = typename Family::File;
     std::string const value(300000, 'n');
-    Operation<File> const operations[] = {{"close", [](File& f) { f.close(); }},
-                                          {"open", [](File& f) { f.open(READ_WRITE); }},
-                                          {"synchronize", [](File& f) { f.synchronize(); }}};
-    for (Operation<File> const& operation : operations) {
-        CAPTURE(operation.label);
+    using Step = void (*)(File&);
+    for (Step const step :
+         {Step([](File& f) { f.close(); }), Step([](File& f) { f.synchronize(); }),
+          Step([](File& f) { f.open(READ_WRITE); })}) {
         CHECK(toldByChild([&] {
-                  OpenFile<Family> const open;
-                  Family::set(*open.file, 0, value);
-                  bool const cancelled =
-                      endsCancelledFromTheStart([&] { operation.run(*open.file); });
-                  test::sizeOf<Family>(*open.file); // waits for ever while the lock is held
-                  std::string const bytes = open.place.bytes();
-                  bool const whole =
-                      bytes == Family::bytes(0, 1) || bytes == Family::bytes(0, 1, value);
-                  open.file->setMode(0); // the destructor has nothing to write
-                  return std::string(cancelled ? "cancelled" : "not cancelled") +
-                         (whole ? ", free, whole" : ", free, damaged");
-              }) == "cancelled, free, whole");
+                  OwnFile<Family> file(one<Family>(), READ_WRITE);
+                  file.put(0, value);
+                  if (!cancelledIn([&] { step(file); }, [] {})) return "not cancelled";
+                  file.count(); // waits for ever while the lock is held
+                  std::string const bytes = file.bytes();
+                  file.setMode(0); // the destructor has nothing to write
+                  bool const whole = bytes == one<Family>() || bytes == one<Family>(value);
+                  return whole ? "free and whole" : "free and damaged";
+              }) == "free and whole");
     }
 }
 
 TEST_CASE_TEMPLATE("a thread cancelled while it waits for the lock does no harm", Family, Sectioned,
                    Flat, Records) {
     CHECK(toldByChild([] {
-              OpenFile<Family> const open;
-              open.file->lock();
-              bool const cancelled = endsCancelled([&] { Family::keys(*open.file); }, cancelSoon);
-              open.file->unlock();
+              OwnFile<Family> file(one<Family>(), READ_WRITE);
+              file.lock();
+              bool const cancelled = endsCancelled([&] { file.count(); },
+                                                   [](pthread_t thread) {
+                                                       ::usleep(20000);
+                                                       ::pthread_cancel(thread);
+                                                   });
+              file.unlock();
               bool right = false;
-              std::thread([&] { right = holds<Family>(*open.file, 0, 1); }).join();
-              return std::string(cancelled ? "cancelled" : "not cancelled") +
-                     (right ? ", as before" : ", changed");
+              OtherThread([&] { right = file.has(1); }).join();
+              return cancelled && right ? "cancelled, as before" : "changed";
           }) == "cancelled, as before");
 }

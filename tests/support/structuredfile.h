@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdio>
-#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -16,20 +15,8 @@
 
 #include "support/slots.h"
 #include "support/tempdir.h"
-#include "support/throws.h"
 
 namespace test {
-
-char const* const NOTHING = "<nothing>";
-char const* const NOT_OPENED = "failed to open file.";
-char const* const NOT_READ = "failed to read from file";
-char const* const NOT_WRITTEN = "failed to write to file";
-
-/// The message of the std::runtime_error that the callable throws.
-template <class Callable>
-std::string complaint(Callable callable) {
-    return messageOf<std::runtime_error>(callable);
-}
 
 /// An operation that takes the lock.
 template <class File>
@@ -230,18 +217,6 @@ bool isWhole(std::string const& bytes, int first, int end) {
     typename Family::File file(directory / "copy");
     file.open(Koru::File::READ);
     return holds<Family>(file, first, end);
-}
-
-/// What a caller sees of a file that is open, with a value of this size.
-inline std::string openState(unsigned long mode, std::size_t size) {
-    return "open, mode " + std::to_string(mode) + ", value of " + std::to_string(size) + "; ";
-}
-
-/// What a caller sees of a file and its entry 0.
-template <class Family>
-std::string stateOf(typename Family::File& file) {
-    if (!file.is_open()) return "closed; ";
-    return openState(file.getMode(), Family::value(file, 0).size());
 }
 
 } // namespace test
