@@ -39,15 +39,15 @@ inline std::string narrowKey(int number) {
 /// ASCII as a wide string.
 inline std::wstring wide(std::string const& text) { return std::wstring(text.begin(), text.end()); }
 
-/// The sectioned settings file, with one section.
-struct Sectioned {
-    using File = Koru::InitializationFile;
-    static char const* label() { return "initialization file"; }
+/// What is alike in the two settings files.
+template <class Family, class SettingsFile>
+struct SettingsFamily {
+    using File = SettingsFile;
     static constexpr unsigned long ADDED_MODE = 0; ///< what `open` adds to the mode
     static constexpr bool CLOSES_ALWAYS = true;    ///< whether the destructor closes what is closed
 
     static std::string bytes(int first, int end, std::string const& value = "value") {
-        std::string result = first == end ? "" : "[s]\n";
+        std::string result = first == end ? "" : Family::header();
         for (int i = first; i < end; ++i) result += narrowKey(i) + "=" + value + "\n";
         return result;
     }
@@ -55,30 +55,19 @@ struct Sectioned {
     static std::string untidyBytes() { return "; comment\n\n" + bytes(0, 1); }
 
     static void set(File& file, int number, std::string const& value = "value") {
-        file.setValue(L"s", entryKey(number), wide(value));
+        Family::put(file, entryKey(number), wide(value));
     }
     static void add(File& file, int number) { set(file, number); }
-    static void remove(File& file, int number) { file.removeKey(L"s", entryKey(number)); }
-    static std::vector<std::wstring> keys(File& file) { return file.enumerateKeys(L"s"); }
+    static void remove(File& file, int number) { Family::erase(file, entryKey(number)); }
     static std::wstring value(File& file, int number) {
-        return file.getValue(L"s", entryKey(number));
+        return Family::get(file, entryKey(number));
     }
 
-    static std::vector<std::size_t> ownSlots() {
-        return {slotOf(&File::enumerateSections), slotOf(&File::createSection),
-                slotOf(&File::removeSection),     slotOf(&File::enumerateKeys),
-                slotOf(&File::createKey),         slotOf(&File::removeKey),
-                slotOf(&File::getValue),          slotOf(&File::setValue)};
-    }
     static std::vector<Operation<File>> ownOperations() {
         return {
-            {"enumerateSections", [](File& f) { f.enumerateSections(); }},
-            {"createSection", [](File& f) { f.createSection(L"n"); }},
-            {"createSection that exists", [](File& f) { f.createSection(L"s"); }},
-            {"removeSection", [](File& f) { f.removeSection(L"s"); }},
-            {"enumerateKeys", [](File& f) { f.enumerateKeys(L"s"); }},
-            {"createKey", [](File& f) { f.createKey(L"s", L"n"); }},
-            {"createKey that exists", [](File& f) { f.createKey(L"s", entryKey(0)); }},
+            {"enumerateKeys", [](File& f) { Family::keys(f); }},
+            {"createKey", [](File& f) { Family::create(f, L"n"); }},
+            {"createKey that exists", [](File& f) { Family::create(f, entryKey(0)); }},
             {"removeKey", [](File& f) { remove(f, 0); }},
             {"removeKey of nothing", [](File& f) { remove(f, 1); }},
             {"getValue", [](File& f) { value(f, 0); }},
@@ -89,44 +78,49 @@ struct Sectioned {
     }
 };
 
-/// The flat settings file.
-struct Flat {
-    using File = Koru::PropertyFile;
-    static char const* label() { return "property file"; }
-    static constexpr unsigned long ADDED_MODE = 0;
-    static constexpr bool CLOSES_ALWAYS = true;
+/// The sectioned settings file, with one section.
+struct Sectioned : SettingsFamily<Sectioned, Koru::InitializationFile> {
+    static char const* label() { return "initialization file"; }
+    static char const* header() { return "[s]\n"; }
+    static std::wstring get(File& f, std::wstring const& key) { return f.getValue(L"s", key); }
+    static void put(File& f, std::wstring const& key, std::wstring const& value) {
+        f.setValue(L"s", key, value);
+    }
+    static void create(File& f, std::wstring const& key) { f.createKey(L"s", key); }
+    static void erase(File& f, std::wstring const& key) { f.removeKey(L"s", key); }
+    static std::vector<std::wstring> keys(File& f) { return f.enumerateKeys(L"s"); }
 
-    static std::string bytes(int first, int end, std::string const& value = "value") {
-        std::string result;
-        for (int i = first; i < end; ++i) result += narrowKey(i) + "=" + value + "\n";
+    static std::vector<std::size_t> ownSlots() {
+        return {slotOf(&File::enumerateSections), slotOf(&File::createSection),
+                slotOf(&File::removeSection),     slotOf(&File::enumerateKeys),
+                slotOf(&File::createKey),         slotOf(&File::removeKey),
+                slotOf(&File::getValue),          slotOf(&File::setValue)};
+    }
+    static std::vector<Operation<File>> ownOperations() {
+        std::vector<Operation<File>> result = SettingsFamily::ownOperations();
+        result.push_back({"enumerateSections", [](File& f) { f.enumerateSections(); }});
+        result.push_back({"createSection", [](File& f) { f.createSection(L"n"); }});
+        result.push_back({"createSection that exists", [](File& f) { f.createSection(L"s"); }});
+        result.push_back({"removeSection", [](File& f) { f.removeSection(L"s"); }});
         return result;
     }
-    static std::string untidyBytes() { return "; comment\n\n" + bytes(0, 1); }
+};
 
-    static void set(File& file, int number, std::string const& value = "value") {
-        file.setValue(entryKey(number), wide(value));
+/// The flat settings file.
+struct Flat : SettingsFamily<Flat, Koru::PropertyFile> {
+    static char const* label() { return "property file"; }
+    static char const* header() { return ""; }
+    static std::wstring get(File& f, std::wstring const& key) { return f.getValue(key); }
+    static void put(File& f, std::wstring const& key, std::wstring const& value) {
+        f.setValue(key, value);
     }
-    static void add(File& file, int number) { set(file, number); }
-    static void remove(File& file, int number) { file.removeKey(entryKey(number)); }
-    static std::vector<std::wstring> keys(File& file) { return file.enumerateKeys(); }
-    static std::wstring value(File& file, int number) { return file.getValue(entryKey(number)); }
+    static void create(File& f, std::wstring const& key) { f.createKey(key); }
+    static void erase(File& f, std::wstring const& key) { f.removeKey(key); }
+    static std::vector<std::wstring> keys(File& f) { return f.enumerateKeys(); }
 
     static std::vector<std::size_t> ownSlots() {
         return {slotOf(&File::enumerateKeys), slotOf(&File::createKey), slotOf(&File::removeKey),
                 slotOf(&File::getValue), slotOf(&File::setValue)};
-    }
-    static std::vector<Operation<File>> ownOperations() {
-        return {
-            {"enumerateKeys", [](File& f) { f.enumerateKeys(); }},
-            {"createKey", [](File& f) { f.createKey(L"n"); }},
-            {"createKey that exists", [](File& f) { f.createKey(entryKey(0)); }},
-            {"removeKey", [](File& f) { remove(f, 0); }},
-            {"removeKey of nothing", [](File& f) { remove(f, 1); }},
-            {"getValue", [](File& f) { value(f, 0); }},
-            {"getValue of nothing", [](File& f) { value(f, 1); }},
-            {"setValue", [](File& f) { set(f, 0, "w"); }},
-            {"setValue of a new key", [](File& f) { set(f, 1, "w"); }},
-        };
     }
 };
 

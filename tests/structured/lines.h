@@ -1,0 +1,82 @@
+// What the tests of the two settings files share: files of key=value lines, in one section where
+// there are sections, and the entries that they give.
+#ifndef KORU_TESTS_STRUCTURED_LINES_H
+#define KORU_TESTS_STRUCTURED_LINES_H
+
+#include <string>
+#include <vector>
+
+#include <koru/string.h>
+
+#include "structured/fixture.h"
+#include "support/shown.h"
+
+namespace structured {
+
+struct Property {
+    std::wstring key;
+    std::wstring value;
+};
+
+inline bool operator==(Property const& a, Property const& b) {
+    return a.key == b.key && a.value == b.value;
+}
+
+using Properties = std::vector<Property>;
+
+/// Like "key/value | key/value".
+inline std::string shown(Properties const& list) {
+    std::string result;
+    for (Property const& p : list) {
+        if (!result.empty()) result += " | ";
+        result += test::shown(p.key) + '/' + test::shown(p.value);
+    }
+    return result;
+}
+
+/// The lines that are written for entries in this order.
+inline std::string textOf(Properties const& list) {
+    std::string text;
+    for (Property const& p : list) {
+        text += Koru::make_string(p.key) + "=" + Koru::make_string(p.value) + "\n";
+    }
+    return text;
+}
+
+/// A settings file of these lines in a place of its own, open.
+template <class Family>
+class Lines : public OwnFile<Family> {
+public:
+    explicit Lines(std::string const& lines, unsigned long mode = READ)
+        : OwnFile<Family>(Family::header() + lines, mode) {}
+
+    std::wstring get(std::wstring const& key) { return Family::get(*this, key); }
+    void put(std::wstring const& key, std::wstring const& value) { Family::put(*this, key, value); }
+    void create(std::wstring const& key) { Family::create(*this, key); }
+    void erase(std::wstring const& key) { Family::erase(*this, key); }
+    std::vector<std::wstring> keys() { return Family::keys(*this); }
+
+    /// Takes the list apart from its front and returns it, each entry exactly as it is held: when
+    /// an entry's turn comes, those before it are gone.
+    Properties drain() {
+        Properties all;
+        for (std::wstring const& key : keys()) {
+            all.push_back({key, get(key)});
+            erase(key);
+        }
+        return all;
+    }
+    std::string drained() { return shown(drain()); }
+
+    /// The lines that the file is closed with.
+    std::string written() {
+        this->setMode(WRITE);
+        this->close();
+        std::string const bytes = this->bytes();
+        return bytes.empty() ? "" : bytes.substr(std::string(Family::header()).size());
+    }
+};
+
+} // namespace structured
+
+#endif
