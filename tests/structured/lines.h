@@ -3,6 +3,9 @@
 #ifndef KORU_TESTS_STRUCTURED_LINES_H
 #define KORU_TESTS_STRUCTURED_LINES_H
 
+#include <doctest/doctest.h>
+
+#include <cstddef>
 #include <string>
 #include <vector>
 
@@ -76,6 +79,27 @@ public:
         return bytes.empty() ? "" : bytes.substr(std::string(Family::header()).size());
     }
 };
+
+struct Row {
+    char const* label;
+    std::string lines;
+    char const* expected; ///< as `shown` shows it
+};
+
+/// Each row's lines are read as the entries expected, and these are written.
+template <class Family>
+void checkRows(std::vector<Row> const& rows) {
+    for (Row const& row : rows) {
+        CAPTURE(row.label);
+        Lines<Family> file(row.lines);
+        CHECK(file.rdstate() == std::ios::eofbit);
+        file.clear();
+        CHECK(static_cast<std::size_t>(file.tellg()) == file.bytes().size());
+        Properties const list = file.drain();
+        CHECK(shown(list) == row.expected);
+        CHECK(test::shown(Lines<Family>(row.lines).written()) == test::shown(textOf(list)));
+    }
+}
 
 } // namespace structured
 

@@ -15,27 +15,6 @@ using namespace std::string_literals;
 
 namespace {
 
-struct Row {
-    char const* label;
-    std::string lines;
-    char const* expected;
-};
-
-/// Each row's lines are read as the entries expected, and these are written.
-template <class Family>
-void checkRows(std::vector<Row> const& rows) {
-    for (Row const& row : rows) {
-        CAPTURE(row.label);
-        Lines<Family> file(row.lines);
-        CHECK(file.rdstate() == std::ios::eofbit);
-        file.clear();
-        CHECK(static_cast<std::size_t>(file.tellg()) == file.bytes().size());
-        Properties const list = file.drain();
-        CHECK(shown(list) == row.expected);
-        CHECK(test::shown(Lines<Family>(row.lines).written()) == test::shown(textOf(list)));
-    }
-}
-
 /// The lines that these entries are written as.
 template <class Family>
 std::string written(Properties const& list) {
