@@ -55,8 +55,7 @@ bool isPrefix(std::string const& part, std::string const& whole) {
 
 } // namespace
 
-TEST_CASE_TEMPLATE("a write-back that cannot open the file again keeps the entries and closes it",
-                   Family, Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("a write-back that cannot open the file again keeps the entries and closes it") {
     for (bool const synchronize : {false, true}) {
         for (bool const obstructed : {false, true}) {
             CAPTURE(synchronize);
@@ -81,8 +80,7 @@ TEST_CASE_TEMPLATE("a write-back that cannot open the file again keeps the entri
     }
 }
 
-TEST_CASE_TEMPLATE("a destructor that cannot open the file again keeps the exception inside",
-                   Family, Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("a destructor that cannot open the file again keeps the exception inside") {
     CHECK(toldByChild([] {
               OwnFile<Family> file("", WRITE);
               file.put(0);
@@ -91,8 +89,7 @@ TEST_CASE_TEMPLATE("a destructor that cannot open the file again keeps the excep
           }) == "alive");
 }
 
-TEST_CASE_TEMPLATE("a directory cannot be read and cannot be opened for writing", Family, Sectioned,
-                   Flat, Records) {
+FAMILIES_TEST_CASE("a directory cannot be read and cannot be opened for writing") {
     OwnFile<Family> file;
     std::filesystem::create_directory(file.place.path());
     file.put(0);
@@ -106,8 +103,7 @@ TEST_CASE_TEMPLATE("a directory cannot be read and cannot be opened for writing"
     CHECK(std::filesystem::is_directory(file.place.path()));
 }
 
-TEST_CASE_TEMPLATE("a file whose first read fails is not an empty file", Family, Sectioned, Flat,
-                   Records) {
+FAMILIES_TEST_CASE("a file whose first read fails is not an empty file") {
     OwnFile<Family> file;
     std::filesystem::create_symlink("/proc/self/mem", file.place.path());
     CHECK(complaint([&] { file.open(READ); }) == NOT_READ);
@@ -115,8 +111,8 @@ TEST_CASE_TEMPLATE("a file whose first read fails is not an empty file", Family,
     CHECK(file.count() == 0);
 }
 
-TEST_CASE_TEMPLATE("a read that fails midway is an error and keeps the complete entries before it",
-                   Family, Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE(
+    "a read that fails midway is an error and keeps the complete entries before it") {
     OwnFile<Family> file(Family::bytes(0, 200));
     std::size_t const entry = Family::bytes(0, 2).size() - one<Family>().size();
     std::size_t const header = one<Family>().size() - entry;
@@ -134,8 +130,7 @@ TEST_CASE_TEMPLATE("a read that fails midway is an error and keeps the complete 
     }
 }
 
-TEST_CASE_TEMPLATE("a read that fails midway is not the end of the file", Family, Sectioned, Flat,
-                   Records) {
+FAMILIES_TEST_CASE("a read that fails midway is not the end of the file") {
     int const count = 20000;
     OwnFile<Family> file(Family::bytes(0, count));
     std::size_t most = 0;
@@ -153,9 +148,8 @@ TEST_CASE_TEMPLATE("a read that fails midway is not the end of the file", Family
     CHECK(file.has(count));
 }
 
-TEST_CASE_TEMPLATE(
-    "a file that could not be read is kept by taking the write bit away before close", Family,
-    Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE(
+    "a file that could not be read is kept by taking the write bit away before close") {
     OwnFile<Family> file(one<Family>());
     CHECK(complaintWithout(Call::READ, EIO, 0, [&] { file.open(READ_WRITE); }) == NOT_READ);
     CHECK(file.isOpen(READ_WRITE));
@@ -165,8 +159,7 @@ TEST_CASE_TEMPLATE(
     CHECK(file.bytes() == one<Family>());
 }
 
-TEST_CASE_TEMPLATE("reads and writes that transfer little at a time make no difference", Family,
-                   Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("reads and writes that transfer little at a time make no difference") {
     for (std::size_t const limit : {1UL, 7UL, 1000UL}) {
         CAPTURE(limit);
         ShortTransfers const limited(limit);
@@ -179,8 +172,7 @@ TEST_CASE_TEMPLATE("reads and writes that transfer little at a time make no diff
     }
 }
 
-TEST_CASE_TEMPLATE("a write that fails leaves the entries, the file open and the mode unchanged",
-                   Family, Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("a write that fails leaves the entries, the file open and the mode unchanged") {
     for (std::size_t const size : {1UL, 100UL, 5000UL, 300000UL}) {
         for (bool const synchronize : {false, true}) {
             for (unsigned long const mode : {WRITE, READ_WRITE}) {
@@ -207,8 +199,7 @@ TEST_CASE_TEMPLATE("a write that fails leaves the entries, the file open and the
     }
 }
 
-TEST_CASE_TEMPLATE("after a write that failed the next close writes everything", Family, Sectioned,
-                   Flat, Records) {
+FAMILIES_TEST_CASE("after a write that failed the next close writes everything") {
     OwnFile<Family> file("", READ_WRITE);
     for (int i = 0; i < 2000; ++i) file.put(i * 7 % 2000);
     {
@@ -236,7 +227,7 @@ void limitFileSize(rlim_t bytes) {
 
 } // namespace
 
-TEST_CASE_TEMPLATE("a file-size limit is a failure to write", Family, Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("a file-size limit is a failure to write") {
     for (std::size_t const size : {1UL, 100UL, 200000UL}) {
         for (rlim_t const limit : {0UL, 1UL, 5UL}) {
             CAPTURE(size);
@@ -259,8 +250,7 @@ TEST_CASE_TEMPLATE("a file-size limit is a failure to write", Family, Sectioned,
     }
 }
 
-TEST_CASE_TEMPLATE("a destructor that cannot write does not end the process", Family, Sectioned,
-                   Flat, Records) {
+FAMILIES_TEST_CASE("a destructor that cannot write does not end the process") {
     for (std::size_t const size : {1UL, 200000UL}) {
         for (bool const closes : {false, true}) {
             for (bool const throws : {false, true}) {
@@ -313,7 +303,7 @@ private:
 
 } // namespace
 
-TEST_CASE_TEMPLATE("a full disk is a failure to write", Family, Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("a full disk is a failure to write") {
     TempDir const directory;
     std::string const told = toldByChild([&] {
         Mount const disk("none", directory.path(), "tmpfs", 0, "size=8k");
@@ -378,9 +368,8 @@ void checkReplacements(Place const& place, Replace replace) {
 
 } // namespace
 
-TEST_CASE_TEMPLATE(
-    "a file that can be written but not deleted keeps no old tail: another file system", Family,
-    Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE(
+    "a file that can be written but not deleted keeps no old tail: another file system") {
     Place const place;
     checkReplacements<Family>(place, [&](std::string const* value) {
         return toldByChild([&]() -> std::string {
@@ -391,9 +380,8 @@ TEST_CASE_TEMPLATE(
     });
 }
 
-TEST_CASE_TEMPLATE(
-    "a file that can be written but not deleted keeps no old tail: a read-only directory", Family,
-    Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE(
+    "a file that can be written but not deleted keeps no old tail: a read-only directory") {
     Place const place;
     checkReplacements<Family>(place, [&](std::string const* value) {
         REQUIRE(::chmod(place.path().c_str(), 0666) == 0);

@@ -3,6 +3,8 @@
 #ifndef KORU_TESTS_STRUCTURED_FIXTURE_H
 #define KORU_TESTS_STRUCTURED_FIXTURE_H
 
+#include <doctest/doctest.h>
+
 #include <cstddef>
 #include <stdexcept>
 #include <string>
@@ -10,6 +12,10 @@
 #include "support/structuredfile.h"
 #include "support/tempdir.h"
 #include "support/throws.h"
+
+/// A test case for each of the three families, and one for each of the two settings files.
+#define FAMILIES_TEST_CASE(name) TEST_CASE_TEMPLATE(name, Family, Sectioned, Flat, Records)
+#define SETTINGS_TEST_CASE(name) TEST_CASE_TEMPLATE(name, Family, Sectioned, Flat)
 
 namespace structured {
 

@@ -25,7 +25,7 @@ std::string written(Properties const& list) {
 
 } // namespace
 
-TEST_CASE_TEMPLATE("lines become entries as the format says", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("lines become entries as the format says") {
     checkRows<Family>({
         {"nothing", "", ""},
         {"one line feed", "\n", ""},
@@ -62,7 +62,7 @@ TEST_CASE_TEMPLATE("lines become entries as the format says", Family, Sectioned,
     });
 }
 
-TEST_CASE_TEMPLATE("a line that begins with # or ; is a comment", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("a line that begins with # or ; is a comment") {
     checkRows<Family>({
         {"both", "#a=1\n;b=2\nk=v\n", "k/v"},
         {"indented", "  #a=1\n\t;b=2\n \t ;\nk=v\n", "k/v"},
@@ -76,7 +76,7 @@ TEST_CASE_TEMPLATE("a line that begins with # or ; is a comment", Family, Sectio
     });
 }
 
-TEST_CASE_TEMPLATE("a carriage return is ordinary text", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("a carriage return is ordinary text") {
     checkRows<Family>({
         {"at the end of lines", "k=v\r\nl=\r\n", "k/v<d> | l/<d>"},
         {"blank lines", "\r\n\r\nk=v\n", "k/v"},
@@ -89,8 +89,7 @@ TEST_CASE_TEMPLATE("a carriage return is ordinary text", Family, Sectioned, Flat
     });
 }
 
-TEST_CASE_TEMPLATE("key and value each end at their first NUL, and lines do not", Family, Sectioned,
-                   Flat) {
+SETTINGS_TEST_CASE("key and value each end at their first NUL, and lines do not") {
     checkRows<Family>({
         {"in a value", "k=a\0b\n"s, "k/a"},
         {"in a key", "a\0b=c\n"s, "a/c"},
@@ -109,8 +108,7 @@ TEST_CASE_TEMPLATE("key and value each end at their first NUL, and lines do not"
     });
 }
 
-TEST_CASE_TEMPLATE("text is UTF-8, decoded as make_wstring decodes it, each part by itself", Family,
-                   Sectioned, Flat) {
+SETTINGS_TEST_CASE("text is UTF-8, decoded as make_wstring decodes it, each part by itself") {
     checkRows<Family>({
         {"two, three and four bytes", "\xC3\xA9\xE2\x82\xAC=\xF0\x9F\x98\x80\n",
          "<e9><20ac>/<1f600>"},
@@ -138,7 +136,7 @@ TEST_CASE_TEMPLATE("text is UTF-8, decoded as make_wstring decodes it, each part
     });
 }
 
-TEST_CASE_TEMPLATE("lines of any length and files of any size are read", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("lines of any length and files of any size are read") {
     std::string const blanks(100000, ' ');
     std::string const tabs(100000, '\t');
     std::string const feeds(100000, '\n');
@@ -158,8 +156,7 @@ TEST_CASE_TEMPLATE("lines of any length and files of any size are read", Family,
     }
 }
 
-TEST_CASE_TEMPLATE("an entry is written as a line, and nothing is escaped", Family, Sectioned,
-                   Flat) {
+SETTINGS_TEST_CASE("an entry is written as a line, and nothing is escaped") {
     CHECK(written<Family>({}) == "");
     CHECK(written<Family>({{L"k", L"v"}}) == "k=v\n");
     CHECK(written<Family>({{L"k", L""}}) == "k=\n");
@@ -170,7 +167,7 @@ TEST_CASE_TEMPLATE("an entry is written as a line, and nothing is escaped", Fami
     CHECK(written<Family>({{L"#k=\n", L"v\n;"}}) == "#k=\n=v\n;\n");
 }
 
-TEST_CASE_TEMPLATE("text is written as make_string encodes it", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("text is written as make_string encodes it") {
     CHECK(written<Family>({{L"\u00E9\u20AC", L"\U0001F600"}}) ==
           "\xC3\xA9\xE2\x82\xAC=\xF0\x9F\x98\x80\n");
     CHECK(written<Family>({{L"k", L"\x7FFFFFFF"}}) == "k=\xFD\xBF\xBF\xBF\xBF\xBF\n");
@@ -185,24 +182,23 @@ TEST_CASE_TEMPLATE("text is written as make_string encodes it", Family, Sectione
     CHECK(written<Family>({{L"k", surrogate}}) == "k=\xED\xA0\x80\n");
 }
 
-TEST_CASE_TEMPLATE("malformed text is written as it was decoded", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("malformed text is written as it was decoded") {
     CHECK(Lines<Family>("\xC1\x81=\x80xyz\nb=\xC0\x80lost\nc=\xF0\x82\x82\xAC\ns\xC3=1\n")
               .written() == "A=?xyz\nb=\nc=\xE2\x82\xAC\ns?=1\n");
 }
 
-TEST_CASE_TEMPLATE("comments, blank lines and spacing are lost when written", Family, Sectioned,
-                   Flat) {
+SETTINGS_TEST_CASE("comments, blank lines and spacing are lost when written") {
     CHECK(Lines<Family>("# top\n\n  a = 1  \n; c\n b=2\n\n\nword\n=x\nM=v").written() ==
           "a = 1\nb=2\nM=v\n");
 }
 
-TEST_CASE_TEMPLATE("duplicates survive writing and reading", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("duplicates survive writing and reading") {
     Lines<Family> file("a=2\nA=5\na=2\nb=1\nB=3\n", READ_WRITE);
     file.synchronize();
     CHECK(file.drained() == "a/2 | A/5 | a/2 | b/1 | B/3");
 }
 
-TEST_CASE_TEMPLATE("keys and values of every length are written whole", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("keys and values of every length are written whole") {
     Lines<Family> file("", WRITE);
     Properties list;
     for (std::size_t length = 0; length <= 600; ++length) {
@@ -214,8 +210,7 @@ TEST_CASE_TEMPLATE("keys and values of every length are written whole", Family, 
     CHECK((Lines<Family>(lines).drain() == list));
 }
 
-TEST_CASE_TEMPLATE("what the format cannot carry is another list when read again", Family,
-                   Sectioned, Flat) {
+SETTINGS_TEST_CASE("what the format cannot carry is another list when read again") {
     Lines<Family> file("", READ_WRITE);
     for (std::wstring const key : {L"", L" ", L" ;comment", L"#comment"}) file.put(key, L"lost");
     file.put(L"a=b", L"c");
@@ -226,7 +221,7 @@ TEST_CASE_TEMPLATE("what the format cannot carry is another list when read again
     CHECK(file.drained() == "a/b=c | empty/ | k/v | two/lines | x/y");
 }
 
-TEST_CASE_TEMPLATE("a missing key gives an empty value or no effect", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("a missing key gives an empty value or no effect") {
     Lines<Family> file("empty=\nk=v\n");
     CHECK(file.get(L"missing").empty());
     CHECK(file.get(L"").empty());
@@ -238,7 +233,7 @@ TEST_CASE_TEMPLATE("a missing key gives an empty value or no effect", Family, Se
     CHECK(file.get(L"k").empty());
 }
 
-TEST_CASE_TEMPLATE("keys match without regard to case and in full", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("keys match without regard to case and in full") {
     Lines<Family> file("Host=a\nHostname=b\nname =c\n");
     CHECK((file.get(L"hOST") == L"a"));
     CHECK((file.get(L"HOSTNAME") == L"b"));
@@ -262,9 +257,8 @@ TEST_CASE_TEMPLATE("keys match without regard to case and in full", Family, Sect
     }
 }
 
-TEST_CASE_TEMPLATE(
-    "setValue replaces the first entry's value in its place and keeps its key's case", Family,
-    Sectioned, Flat) {
+SETTINGS_TEST_CASE(
+    "setValue replaces the first entry's value in its place and keeps its key's case") {
     Lines<Family> file("A=1\nb=2\n# note\nB=3\nc=4\n");
     file.put(L"B", L"new");
     file.put(L"a", L"");
@@ -272,8 +266,7 @@ TEST_CASE_TEMPLATE(
     CHECK(file.drained() == "A/ | b/new | B/3 | c/4");
 }
 
-TEST_CASE_TEMPLATE("setValue adds a missing entry at the end of the list", Family, Sectioned,
-                   Flat) {
+SETTINGS_TEST_CASE("setValue adds a missing entry at the end of the list") {
     Lines<Family> file("m=1\n");
     file.put(L"a", L"2");
     file.put(L"Z", L"3");
@@ -283,15 +276,13 @@ TEST_CASE_TEMPLATE("setValue adds a missing entry at the end of the list", Famil
     CHECK(file.drained() == "m/1 | a/2 | Z/3 | /5 | b/");
 }
 
-TEST_CASE_TEMPLATE("createKey adds a missing entry and keeps the value of one that exists", Family,
-                   Sectioned, Flat) {
+SETTINGS_TEST_CASE("createKey adds a missing entry and keeps the value of one that exists") {
     Lines<Family> file("m=1\nM=2\n");
     for (wchar_t const* const key : {L"M", L"new", L"NEW", L"", L"", L"a"}) file.create(key);
     CHECK(file.drained() == "m/1 | M/2 | new/ | / | a/");
 }
 
-TEST_CASE_TEMPLATE("removeKey removes only the first of two keys that differ in case", Family,
-                   Sectioned, Flat) {
+SETTINGS_TEST_CASE("removeKey removes only the first of two keys that differ in case") {
     Lines<Family> file("k=1\nK=2\n");
     CHECK((file.get(L"k") == L"1"));
     CHECK((file.get(L"K") == L"1"));
@@ -301,7 +292,7 @@ TEST_CASE_TEMPLATE("removeKey removes only the first of two keys that differ in 
     CHECK(file.written() == "K=2\n");
 }
 
-TEST_CASE_TEMPLATE("later entries move up in order when one is removed", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("later entries move up in order when one is removed") {
     Lines<Family> file("a=1\nb=2\nB=3\nb=4\nc=5\n");
     file.erase(L"B");
     CHECK((file.get(L"b") == L"3"));
@@ -313,8 +304,7 @@ TEST_CASE_TEMPLATE("later entries move up in order when one is removed", Family,
     CHECK(file.drained() == "B/new | b/4 | c/5 | A/6");
 }
 
-TEST_CASE_TEMPLATE("values and keys are held as they were set until they are written", Family,
-                   Sectioned, Flat) {
+SETTINGS_TEST_CASE("values and keys are held as they were set until they are written") {
     Lines<Family> file("", READ_WRITE);
     std::wstring const odd = L"a\0b"s + static_cast<wchar_t>(0x80000041) +
                              static_cast<wchar_t>(0xFFFFFFFF) + static_cast<wchar_t>(0xD800) +
@@ -335,7 +325,7 @@ TEST_CASE_TEMPLATE("values and keys are held as they were set until they are wri
     CHECK(file.drained() == "k/a | n/");
 }
 
-TEST_CASE_TEMPLATE("keys of units that no UTF-8 gives are found again", Family, Sectioned, Flat) {
+SETTINGS_TEST_CASE("keys of units that no UTF-8 gives are found again") {
     Lines<Family> file("");
     for (unsigned long const unit : {0x80000000UL, 0x80000041UL, 0xC0000000UL, 0xFFFFFFFFUL,
                                      0x7FFFFFFFUL, 0xD800UL, 0x110000UL}) {
@@ -347,8 +337,7 @@ TEST_CASE_TEMPLATE("keys of units that no UTF-8 gives are found again", Family, 
     }
 }
 
-TEST_CASE_TEMPLATE("a list that empties and fills again and again holds what was set last", Family,
-                   Sectioned, Flat) {
+SETTINGS_TEST_CASE("a list that empties and fills again and again holds what was set last") {
     Lines<Family> file("a=from the file\nb=from the file\n", READ_WRITE);
     for (int i = 0; i < 1000; ++i) {
         std::wstring const number = std::to_wstring(i);

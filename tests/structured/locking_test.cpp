@@ -92,14 +92,14 @@ bool cancelledIn(Step step, Meanwhile meanwhile) {
 
 } // namespace
 
-TEST_CASE_TEMPLATE("every operation leaves the lock free", Family, Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("every operation leaves the lock free") {
     for (auto const& operation : allOperations<Family>()) {
         CAPTURE(operation.label);
         CHECK(lockAfter<Family>(operation.run) == "free");
     }
 }
 
-TEST_CASE_TEMPLATE("every exception leaves the lock free", Family, Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("every exception leaves the lock free") {
     using File = typename Family::File;
     CHECK(lockAfter<Family>([](File& f) {
               f.close();
@@ -128,8 +128,7 @@ TEST_CASE_TEMPLATE("every exception leaves the lock free", Family, Sectioned, Fl
           }) == "failed to open file., free");
 }
 
-TEST_CASE_TEMPLATE("stream exceptions that a caller enabled leave the lock free", Family, Sectioned,
-                   Flat, Records) {
+FAMILIES_TEST_CASE("stream exceptions that a caller enabled leave the lock free") {
     using File = typename Family::File;
     for (bool const fails : {false, true}) {
         std::string const result = lockAfter<Family>([fails](File& f) {
@@ -145,8 +144,7 @@ TEST_CASE_TEMPLATE("stream exceptions that a caller enabled leave the lock free"
     }
 }
 
-TEST_CASE_TEMPLATE("every operation waits while another thread holds the lock", Family, Sectioned,
-                   Flat, Records) {
+FAMILIES_TEST_CASE("every operation waits while another thread holds the lock") {
     for (auto const& operation : allOperations<Family>()) {
         CAPTURE(operation.label);
         OwnFile<Family> file(one<Family>(), READ_WRITE);
@@ -158,8 +156,7 @@ TEST_CASE_TEMPLATE("every operation waits while another thread holds the lock", 
     }
 }
 
-TEST_CASE_TEMPLATE("every operation works for the thread that holds the lock", Family, Sectioned,
-                   Flat, Records) {
+FAMILIES_TEST_CASE("every operation works for the thread that holds the lock") {
     for (auto const& operation : allOperations<Family>()) {
         CAPTURE(operation.label);
         OwnFile<Family> file(one<Family>(), READ_WRITE);
@@ -169,8 +166,7 @@ TEST_CASE_TEMPLATE("every operation works for the thread that holds the lock", F
     }
 }
 
-TEST_CASE_TEMPLATE("the destructor waits while another thread holds the lock", Family, Sectioned,
-                   Flat, Records) {
+FAMILIES_TEST_CASE("the destructor waits while another thread holds the lock") {
     Place const place;
     auto* const file = new typename Family::File(place.path());
     file->open(WRITE);
@@ -184,8 +180,7 @@ TEST_CASE_TEMPLATE("the destructor waits while another thread holds the lock", F
     CHECK(place.bytes() == one<Family>());
 }
 
-TEST_CASE_TEMPLATE("the lock is held across the whole read of open", Family, Sectioned, Flat,
-                   Records) {
+FAMILIES_TEST_CASE("the lock is held across the whole read of open") {
     // The pipe keeps open reading until the test has seen that the lock is taken.
     CHECK(toldByChild([&] {
               OwnFile<Family> file;
@@ -204,8 +199,7 @@ TEST_CASE_TEMPLATE("the lock is held across the whole read of open", Family, Sec
           }) == "it waits for all");
 }
 
-TEST_CASE_TEMPLATE("the lock is held across the whole write-back of close and synchronize", Family,
-                   Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("the lock is held across the whole write-back of close and synchronize") {
     for (bool const synchronize : {false, true}) {
         CAPTURE(synchronize);
         CHECK(toldByChild([&] {
@@ -224,8 +218,7 @@ TEST_CASE_TEMPLATE("the lock is held across the whole write-back of close and sy
     }
 }
 
-TEST_CASE_TEMPLATE("edits of several threads are not lost while others synchronize", Family,
-                   Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("edits of several threads are not lost while others synchronize") {
     OwnFile<Family> file("", READ_WRITE);
     int const count = 60;
     std::vector<std::thread> threads;
@@ -252,8 +245,7 @@ TEST_CASE_TEMPLATE("edits of several threads are not lost while others synchroni
     }
 }
 
-TEST_CASE_TEMPLATE("the destructor completes its work in a thread that is being cancelled", Family,
-                   Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("the destructor completes its work in a thread that is being cancelled") {
     std::string const value(300000, 'n');
     for (bool const lockIsHeld : {false, true}) {
         CAPTURE(lockIsHeld);
@@ -279,8 +271,7 @@ TEST_CASE_TEMPLATE("the destructor completes its work in a thread that is being 
     }
 }
 
-TEST_CASE_TEMPLATE("a thread cancelled in an operation leaves the lock free and a whole file",
-                   Family, Sectioned, Flat, Records) {
+FAMILIES_TEST_CASE("a thread cancelled in an operation leaves the lock free and a whole file") {
     using File = typename Family::File;
     std::string const value(300000, 'n');
     using Step = void (*)(File&);
@@ -300,8 +291,7 @@ TEST_CASE_TEMPLATE("a thread cancelled in an operation leaves the lock free and 
     }
 }
 
-TEST_CASE_TEMPLATE("a thread cancelled while it waits for the lock does no harm", Family, Sectioned,
-                   Flat, Records) {
+FAMILIES_TEST_CASE("a thread cancelled while it waits for the lock does no harm") {
     CHECK(toldByChild([] {
               OwnFile<Family> file(one<Family>(), READ_WRITE);
               file.lock();
