@@ -24,10 +24,10 @@ using test::fileBytes;
 using test::held;
 using test::isFree;
 using test::memoryRanOut;
+using test::Place;
 using test::READ;
 using test::READ_WRITE;
 using test::record;
-using test::RecordPlace;
 using test::runOutOfMemory;
 using test::Watchdog;
 using test::WRITE;
@@ -70,7 +70,7 @@ void openAndEdit(DataFile& file, unsigned long mode, Edit const& edit) {
 template <class WriteBack>
 void checkWriteBack(WriteBack writeBack, std::vector<unsigned long> const& modes) {
     Watchdog const watchdog;
-    RecordPlace const place;
+    Place const place;
     for (Edit const& edit : edits()) {
         for (unsigned long const mode : modes) {
             for (Failing const failing : {Failing::ONE, Failing::ONE_AND_ALL_LATER}) {
@@ -82,13 +82,13 @@ void checkWriteBack(WriteBack writeBack, std::vector<unsigned long> const& modes
                     place.write(fileBytes(edit.stored));
                     DataFile file(place.path());
                     openAndEdit(file, mode, edit);
-                    std::string const old = place.content();
+                    std::string const old = place.bytes();
                     std::string const complete = fileBytes(held(file));
                     std::string const outcome =
                         runOutOfMemory(before, failing, [&] { writeBack(file); });
                     REQUIRE(place.exists());
-                    bool const isOld = place.content() == old;
-                    bool const isNew = place.content() == complete;
+                    bool const isOld = place.bytes() == old;
+                    bool const isNew = place.bytes() == complete;
                     if (outcome == "done") {
                         CHECK(isNew);
                     } else {
@@ -117,7 +117,7 @@ TEST_CASE("when memory runs out in synchronize, the old file or the new one is t
 }
 
 TEST_CASE("when memory runs out before the old file is deleted, the records are still held") {
-    RecordPlace const place;
+    Place const place;
     place.write(fileBytes(numbered(L"k", 70, 10)));
     DataFile file(place.path());
     file.open(READ_WRITE);
@@ -128,11 +128,11 @@ TEST_CASE("when memory runs out before the old file is deleted, the records are 
     CHECK(file.is_open());
     checkSame(held(file), entries);
     file.close();
-    CHECK(place.content() == fileBytes(entries));
+    CHECK(place.bytes() == fileBytes(entries));
 }
 
 TEST_CASE("when memory runs out in the destructor, the process goes on and no file is cut") {
-    RecordPlace const place;
+    Place const place;
     for (Edit const& edit : edits()) {
         for (Failing const failing : {Failing::ONE, Failing::ONE_AND_ALL_LATER}) {
             for (long before = 0;; ++before) {
@@ -148,8 +148,8 @@ TEST_CASE("when memory runs out in the destructor, the process goes on and no fi
                     std::string const complete = fileBytes(held(*file));
                     if (runOutOfMemory(before, failing, [&] { file.reset(); }) != "done") return 1;
                     bool const ranOut = memoryRanOut();
-                    if (place.content() == complete) return ranOut ? 42 : 43;
-                    return place.content() == old && ranOut ? 42 : 2;
+                    if (place.bytes() == complete) return ranOut ? 42 : 43;
+                    return place.bytes() == old && ranOut ? 42 : 2;
                 });
                 CHECK(outcome.signal == 0);
                 if (outcome.exitCode == 43) break;
@@ -161,7 +161,7 @@ TEST_CASE("when memory runs out in the destructor, the process goes on and no fi
 
 TEST_CASE("when memory runs out in open, a later open works") {
     Watchdog const watchdog;
-    RecordPlace const place;
+    Place const place;
     for (Edit const& edit : edits()) {
         std::string const content = fileBytes(edit.stored) + fileBytes(edit.inserted);
         Entries const expected = test::load(content).entries;
@@ -186,7 +186,7 @@ TEST_CASE("when memory runs out in open, a later open works") {
                         file.close();
                         file.open(READ);
                     }
-                    bool const same = place.content() == content;
+                    bool const same = place.bytes() == content;
                     CHECK(same);
                     checkSameRecords(held(file), expected);
                     file.setMode(READ);
@@ -251,7 +251,7 @@ TEST_CASE("when memory runs out in setKey or setData, the record keeps a key and
 }
 
 TEST_CASE("when memory runs out in the constructor, nothing is left behind") {
-    RecordPlace const place;
+    Place const place;
     Koru::File::Path const path(place.path());
     for (long before = 0;; ++before) {
         std::string const outcome =

@@ -26,9 +26,9 @@ using test::fileBytes;
 using test::held;
 using test::isInOrderOfAddresses;
 using test::messageOf;
+using test::Place;
 using test::READ;
 using test::READ_WRITE;
-using test::RecordPlace;
 using test::sameKey;
 using Record = Koru::DataFile::Record;
 
@@ -161,12 +161,12 @@ void changeOne(DataFile& file, Model& model, Chance& chance, Record const& recor
 }
 
 /// Writes and reads again; a key that does not come back ends the reading.
-void synchronize(RecordPlace const& place, DataFile& file, Model& model) {
+void synchronize(Place const& place, DataFile& file, Model& model) {
     std::string const content = fileBytes(model.entries());
     test::Loaded const expected = test::load(content);
     std::string const message = messageOf<std::exception>([&] { file.synchronize(); });
     CHECK((message == "<nothing>") == (expected.message == "<nothing>"));
-    bool const same = place.content() == content;
+    bool const same = place.bytes() == content;
     CHECK(same);
     model.adopt(file);
     checkSameRecords(held(file), expected.entries);
@@ -175,7 +175,7 @@ void synchronize(RecordPlace const& place, DataFile& file, Model& model) {
 } // namespace
 
 TEST_CASE("any sequence of operations gives what the model gives, position by position") {
-    RecordPlace const place;
+    Place const place;
     for (std::uint32_t seed = 1; seed <= 30; ++seed) {
         CAPTURE(seed);
         Chance chance(seed);
@@ -199,13 +199,13 @@ TEST_CASE("any sequence of operations gives what the model gives, position by po
             compare(file, model);
         }
         file.close();
-        bool const same = place.content() == fileBytes(model.entries());
+        bool const same = place.bytes() == fileBytes(model.entries());
         CHECK(same);
     }
 }
 
 TEST_CASE("records that nobody looks at are inserted and removed as the model says") {
-    RecordPlace const place;
+    Place const place;
     for (std::uint32_t seed = 100; seed < 110; ++seed) {
         CAPTURE(seed);
         Chance chance(seed);
@@ -231,7 +231,7 @@ TEST_CASE("records that nobody looks at are inserted and removed as the model sa
         file.setMode(Koru::File::WRITE);
         Entries const before = seed % 2 == 0 ? held(file) : Entries();
         file.close();
-        std::string const content = place.content();
+        std::string const content = place.bytes();
         if (seed % 2 == 0) {
             checkSameRecords(before, model);
             bool const same = content == fileBytes(before);
@@ -246,7 +246,7 @@ TEST_CASE("records that nobody looks at are inserted and removed as the model sa
 }
 
 TEST_CASE("records of up to 1 MiB with keys of every low byte are written and read") {
-    RecordPlace const place;
+    Place const place;
     for (std::uint32_t seed = 200; seed < 206; ++seed) {
         CAPTURE(seed);
         Chance chance(seed);
@@ -255,7 +255,7 @@ TEST_CASE("records of up to 1 MiB with keys of every low byte are written and re
         for (int i = 0; i < 25; ++i) file.insert(randomRecord(chance, (1U << 20) + 1));
         Entries const entries = held(file);
         file.close();
-        std::string const content = place.content();
+        std::string const content = place.bytes();
         bool const same = content == fileBytes(entries);
         CHECK(same);
         test::Loaded const expected = test::load(content);
@@ -267,7 +267,7 @@ TEST_CASE("records of up to 1 MiB with keys of every low byte are written and re
 }
 
 TEST_CASE("a file of any bytes is read as the model reads it") {
-    RecordPlace const place;
+    Place const place;
     Chance chance(300);
     for (int round = 0; round < 1500; ++round) {
         CAPTURE(round);

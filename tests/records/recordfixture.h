@@ -12,7 +12,6 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
-#include <filesystem>
 #include <functional>
 #include <future>
 #include <new>
@@ -33,6 +32,8 @@ unsigned long const WRITE = Koru::File::WRITE;
 unsigned long const BINARY = Koru::File::BINARY;
 unsigned long const READ_WRITE = Koru::File::READ | Koru::File::WRITE;
 
+char const* const NO_KEY = "zero length key";
+
 using Bytes = std::vector<unsigned char>;
 
 inline Bytes bytes(std::string const& text) { return {text.begin(), text.end()}; }
@@ -52,12 +53,17 @@ inline bool operator<(Entry const& a, Entry const& b) {
 
 using Entries = std::vector<Entry>;
 
+inline Entry entry(std::wstring const& key, std::string const& data = "") {
+    return {key, bytes(data)};
+}
+
 inline Koru::DataFile::Record record(std::wstring const& key, std::string const& data = "") {
     return {key, bytes(data)};
 }
 
-// --------------------------------------------------------------------------------- what is
-// expected
+inline Entry entryOf(Koru::DataFile::Record const& held) { return {held.getKey(), held.getData()}; }
+
+// ---------------------------------------------------------------------------- what is expected
 
 /// Whether keys are equal: as the C library compares them, up to the first NUL.
 inline bool sameKey(std::wstring const& a, std::wstring const& b) {
@@ -72,11 +78,10 @@ inline std::wstring storedKey(std::wstring key) {
     if (first != std::wstring::npos) key.erase(0, first);
     std::size_t const last = key.find_last_not_of(blanks);
     if (last != std::wstring::npos) key.erase(last + 1);
-    if (key.empty() || key[0] == L'\0') throw std::invalid_argument("zero length key");
+    if (key.empty() || key[0] == L'\0') throw std::invalid_argument(NO_KEY);
     return key;
 }
 
-/// A length field.
 inline std::string lengthField(std::uint32_t length) {
     std::string field;
     for (int shift = 0; shift < 32; shift += 8) field += static_cast<char>(length >> shift & 0xFFU);
@@ -139,32 +144,48 @@ inline Loaded load(std::string rest) {
     return result;
 }
 
-// -------------------------------------------------------------------------------- what there is
-
-/// A record file's place, without the file at first.
-class RecordPlace {
-public:
-    std::string const& path() const { return path_; }
-    TempDir const& directory() const { return directory_; }
-    void write(std::string const& content) const {
-        std::filesystem::remove(path_);
-        writeFile(path_, content);
-    }
-    std::string content() const { return readFile(path_); }
-    bool exists() const { return std::filesystem::exists(path_); }
-
-private:
-    TempDir directory_;
-    std::string path_ = directory_ / "records.dat";
-};
-
-inline Entry entryOf(Koru::DataFile::Record const& held) { return {held.getKey(), held.getData()}; }
+// ------------------------------------------------------------------------------- what there is
 
 /// The records held, by position.
 inline Entries held(Koru::DataFile& file) {
     Entries entries;
     for (unsigned long i = 0; i < file.size(); ++i) entries.push_back(entryOf(file[i]));
     return entries;
+}
+
+inline void insertAll(Koru::DataFile& file, Entries const& entries) {
+    for (Entry const& e : entries) file.insert({e.key, e.data});
+}
+
+/// What a file of these bytes is loaded as.
+inline Entries loaded(Place const& place, std::string const& content) {
+    place.write(content);
+    Koru::DataFile file(place.path());
+    file.open(READ);
+    return held(file);
+}
+
+/// The bytes of the file that these records are written to.
+inline std::string written(Place const& place, std::vector<Koru::DataFile::Record> const& records) {
+    Koru::DataFile file(place.path());
+    file.open(WRITE);
+    for (Koru::DataFile::Record const& r : records) file.insert(r);
+    file.close();
+    return place.bytes();
+}
+
+/// The message with which opening ends, of the exception of the type that belongs to it.
+inline std::string openMessage(Koru::DataFile& file, unsigned long mode) {
+    try {
+        file.open(mode);
+    } catch (std::bad_alloc const&) {
+        return "std::bad_alloc";
+    } catch (std::invalid_argument const& e) {
+        return e.what() == std::string(NO_KEY) ? NO_KEY : "another invalid_argument";
+    } catch (std::runtime_error const& e) {
+        return e.what() == std::string(NO_KEY) ? "wrong type" : e.what();
+    }
+    return "<nothing>";
 }
 
 inline Entries sorted(Entries entries) {
