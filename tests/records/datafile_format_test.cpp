@@ -1,14 +1,9 @@
 // The record file's format: what is written, what is read, and files that are damaged or hostile.
 #include <doctest/doctest.h>
 
-#include <sys/resource.h>
-#include <unistd.h>
-
 #include <cstddef>
 #include <cstdint>
-#include <cstdio>
 #include <filesystem>
-#include <fstream>
 #include <random>
 #include <stdexcept>
 #include <string>
@@ -21,28 +16,8 @@
 #include "support/subprocess.h"
 #include "support/throws.h"
 
+using namespace test;
 using Koru::DataFile;
-using test::BINARY;
-using test::checkKey;
-using test::checkSame;
-using test::checkSameRecords;
-using test::Entries;
-using test::Entry;
-using test::entry;
-using test::fileBytes;
-using test::held;
-using test::insertAll;
-using test::isFree;
-using test::lengthField;
-using test::loaded;
-using test::NO_KEY;
-using test::openMessage;
-using test::Place;
-using test::READ;
-using test::READ_WRITE;
-using test::shown;
-using test::WRITE;
-using test::written;
 using Record = Koru::DataFile::Record;
 using namespace std::string_literals;
 
@@ -55,8 +30,6 @@ char const* const NOTHING = "<nothing>";
 Entry oddEntry(std::wstring const& key, std::string const& data) {
     return entry(key + L'\0', data);
 }
-
-Record record(std::wstring const& key) { return test::record(key); }
 
 } // namespace
 
@@ -84,7 +57,7 @@ TEST_CASE("records are written as length and key, length and data") {
              {"blanks only", L" \t\n", "", "\6\0\0\0\0 \0\t\0\n\0\0\0\0"s},
          }) {
         CAPTURE(row.label);
-        CHECK(shown(written(place, {test::record(row.key, row.data)})) == shown(row.expected));
+        CHECK(shown(written(place, {record(row.key, row.data)})) == shown(row.expected));
     }
 }
 
@@ -98,7 +71,7 @@ TEST_CASE("a default record is written with an empty key, which cannot be read")
     Place const place;
     CHECK(written(place, {Record()}) == std::string(8, '\0'));
     Record nameless;
-    nameless.setData(test::bytes("data"));
+    nameless.setData(bytes("data"));
     CHECK(written(place, {nameless}) == "\0\0\0\0\4\0\0\0data"s);
     DataFile file(place.path());
     CHECK(openMessage(file, READ) == NO_KEY);
@@ -110,7 +83,7 @@ TEST_CASE("lengths are four bytes, the lowest first") {
     Place const place;
     std::wstring const key(0x12345, L'k');
     std::string const data(0x54321, 'd');
-    std::string const content = written(place, {test::record(key, data)});
+    std::string const content = written(place, {record(key, data)});
     REQUIRE(content.size() == 8 + 2 * key.size() + data.size());
     CHECK(content.substr(0, 4) == "\x8A\x46\x02\x00"s);
     CHECK(content.substr(4 + 2 * key.size(), 4) == "\x21\x43\x05\x00"s);
@@ -241,7 +214,7 @@ TEST_CASE("the NUL that ends an odd key is written, so the key grows to an even 
 
 TEST_CASE("characters that do not survive in a key do so at the second reading") {
     Place const place;
-    written(place, {test::record(L"\u00E9\u0141", "d")});
+    written(place, {record(L"\u00E9\u0141", "d")});
     Entries const once{entry({static_cast<wchar_t>(0xFFFFFFE9), L'A'}, "d")};
     DataFile file(place.path());
     file.open(READ_WRITE);
@@ -251,22 +224,6 @@ TEST_CASE("characters that do not survive in a key do so at the second reading")
 }
 
 namespace {
-
-/// Writes these records and reads them again, both as the plain rules say.
-void checkWrittenAndRead(Place const& place, Entries const& entries) {
-    DataFile file(place.path());
-    file.open(WRITE);
-    insertAll(file, entries);
-    Entries const inserted = held(file);
-    checkSameRecords(inserted, entries);
-    file.close();
-    bool const same = place.bytes() == fileBytes(inserted);
-    CHECK(same);
-    test::Loaded const expected = test::load(fileBytes(inserted));
-    CHECK(expected.message == NOTHING);
-    file.open(READ);
-    checkSameRecords(held(file), expected.entries);
-}
 
 std::string pattern(std::size_t size) {
     std::string result;
@@ -283,8 +240,8 @@ TEST_CASE("every size of key and data around the sizes of buffers is written and
         for (std::size_t size = middle - 20; size < middle + 6; ++size) {
             CAPTURE(size);
             std::wstring const longKey(size / 2 + 2, L'k');
-            checkWrittenAndRead(place, {entry(L"a", data.substr(0, size)),
-                                        entry(longKey, data.substr(1, 30)), entry(L"c", "z")});
+            writeAndRead(place, {entry(L"a", data.substr(0, size)),
+                                 entry(longKey, data.substr(1, 30)), entry(L"c", "z")});
         }
     }
 }
@@ -312,8 +269,8 @@ TEST_CASE("keys of every length and any characters are written and read as the p
         // And half a character more.
         content += lengthField(static_cast<std::uint32_t>(2 * length + 1)) +
                    std::string(2 * length + 1, '\xF1') + lengthField(0);
-        checkWrittenAndRead(place, entries);
-        test::Loaded const expected = test::load(content);
+        CHECK(writeAndRead(place, entries) == 20);
+        Loaded const expected = load(content);
         CHECK(expected.entries.size() == 21);
         checkSameRecords(loaded(place, content), expected.entries);
     }
@@ -324,8 +281,8 @@ TEST_CASE("large data and long keys survive writing and reading") {
     std::string const large = pattern(10UL << 20);
     std::wstring longKey;
     for (int i = 0; i < 100000; ++i) longKey += static_cast<wchar_t>(L'!' + i % 90);
-    checkWrittenAndRead(place, {entry(L"1 MiB", large.substr(0, 1UL << 20)),
-                                entry(L"10 MiB", large), entry(longKey, large.substr(0, 1000))});
+    writeAndRead(place, {entry(L"1 MiB", large.substr(0, 1UL << 20)), entry(L"10 MiB", large),
+                         entry(longKey, large.substr(0, 1000))});
     DataFile file(place.path());
     file.open(READ);
     file.insert(record(longKey));
@@ -343,70 +300,14 @@ TEST_CASE("synchronize of records that cannot be read again keeps those before")
     file.insert(record(L"l"));
     Entries const entries = held(file);
     file[1] = Record();
-    CHECK(test::messageOf<std::invalid_argument>([&] { file.synchronize(); }) == NO_KEY);
+    CHECK(messageOf<std::invalid_argument>([&] { file.synchronize(); }) == NO_KEY);
     CHECK(file.is_open());
     checkSame(held(file), {entries[0]});
     CHECK(isFree(file));
     CHECK(place.bytes() == fileBytes({entries[0], entry(L"")}));
 }
 
-// ------------------------------------------------------------------- damaged and hostile files
-
 namespace {
-
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-bool const MEMORY_CAN_BE_LIMITED = false; // the sanitizers reserve more than any limit allows
-#else
-bool const MEMORY_CAN_BE_LIMITED = true;
-#endif
-
-/// Gives this process 256 MiB more address space than it has now. Only for child processes.
-void limitMemory() {
-    if (!MEMORY_CAN_BE_LIMITED) return;
-    std::size_t pages = 0;
-    std::ifstream("/proc/self/statm") >> pages;
-    rlimit limit = {};
-    ::getrlimit(RLIMIT_AS, &limit);
-    limit.rlim_cur = pages * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE)) + (256UL << 20);
-    ::setrlimit(RLIMIT_AS, &limit);
-}
-
-/// Opens a file of these bytes and says what is not as it should be; "" when all is well.
-std::string faultWith(Place const& place, std::string const& content) {
-    test::Loaded const expected = test::load(content);
-    place.write(content);
-    DataFile file(place.path());
-    std::string const message = openMessage(file, READ);
-    std::string fault;
-    if (message != expected.message) fault += message + " instead of " + expected.message + ", ";
-    if (!file.is_open()) fault += "not open, ";
-    if (test::sorted(held(file)) != test::sorted(expected.entries)) fault += "other records, ";
-    if (!isFree(file)) fault += "still locked, ";
-    // The object can still be used.
-    place.write(fileBytes(entry(L"good", "file")));
-    file.close();
-    file.open(READ);
-    if (file.size() != 1) fault += "not usable, ";
-    return fault;
-}
-
-/// Tries all of these files in a child with little memory.
-void checkFaultless(std::vector<std::string> const& contents) {
-    Place const place;
-    REQUIRE(!contents.empty());
-    test::Outcome const outcome = test::inChild([&] {
-        ::alarm(250);
-        limitMemory();
-        for (std::string const& content : contents) {
-            std::string const fault = faultWith(place, content);
-            if (!fault.empty()) std::printf("%s: %s\n", shown(content).c_str(), fault.c_str());
-        }
-        std::printf("tried all");
-        return 0;
-    });
-    CHECK(outcome.exitCode == 0);
-    CHECK(outcome.out == "tried all");
-}
 
 std::string fewEntries() {
     return fileBytes({entry(L"ab", "\1\2\3"), entry(L"name"), entry(L"a\0b"s, "text"),
@@ -417,7 +318,7 @@ std::string fewEntries() {
 
 TEST_CASE("every prefix of a file gives its complete entries and a failure to read") {
     std::string const whole = fewEntries() + fileBytes({entry(L"", "no key"), entry(L"last", "x")});
-    CHECK(test::load(whole).message == NO_KEY);
+    CHECK(load(whole).message == NO_KEY);
     std::vector<std::string> contents;
     for (std::size_t size = 0; size <= whole.size(); ++size) {
         contents.push_back(whole.substr(0, size));
@@ -483,7 +384,7 @@ TEST_CASE("a length that the file has but memory does not ends in std::bad_alloc
         CAPTURE(row.label);
         place.write(fileBytes(entry(L"first", "data")) + row.lengths);
         std::filesystem::resize_file(place.path(), row.size);
-        test::Outcome const outcome = test::inChild([&] {
+        Outcome const outcome = inChild([&] {
             ::alarm(100);
             limitMemory();
             DataFile file(place.path());

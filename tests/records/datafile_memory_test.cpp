@@ -16,25 +16,8 @@
 #include "support/subprocess.h"
 #include "support/throws.h"
 
+using namespace test;
 using Koru::DataFile;
-using test::checkSame;
-using test::checkSameRecords;
-using test::Entries;
-using test::Entry;
-using test::fileBytes;
-using test::forEachFailure;
-using test::held;
-using test::insertAll;
-using test::isFree;
-using test::MemoryPlan;
-using test::memoryRanOut;
-using test::Place;
-using test::READ;
-using test::READ_WRITE;
-using test::record;
-using test::runOutOfMemory;
-using test::Watchdog;
-using test::WRITE;
 using Record = Koru::DataFile::Record;
 
 namespace {
@@ -49,7 +32,7 @@ struct Edit {
 Entries numbered(std::wstring const& prefix, int count, std::size_t dataSize) {
     Entries entries;
     for (int i = 0; i < count; ++i) {
-        entries.push_back({prefix + std::to_wstring(i), test::Bytes(dataSize, 'd')});
+        entries.push_back({prefix + std::to_wstring(i), Bytes(dataSize, 'd')});
     }
     return entries;
 }
@@ -61,7 +44,7 @@ void forEachEditAndFailure(Attempt attempt) {
              {"nothing at all", {}, {}},
              {"one record", numbered(L"k", 1, 4), {}},
              {"one record more", numbered(L"k", 1, 4), numbered(L"l", 1, 100)},
-             {"long key and data", {}, {{std::wstring(50000, L'k'), test::Bytes(200000, 'd')}}},
+             {"long key and data", {}, {{std::wstring(50000, L'k'), Bytes(200000, 'd')}}},
              {"many records", numbered(L"a somewhat long key ", 70, 30), numbered(L"k", 70, 3)},
          }) {
         CAPTURE(edit.label);
@@ -90,7 +73,7 @@ void checkWriteBack(void (DataFile::*writeBack)(), unsigned long mode) {
         if (outcome != "done") CHECK(outcome == "std::bad_alloc");
         CHECK(isFree(file));
         if (!memoryRanOut()) return false;
-        CHECK(test::messageOf<std::exception>([&] { file.close(); }) == "<nothing>");
+        CHECK(messageOf<std::exception>([&] { file.close(); }) == "<nothing>");
         return true;
     });
 }
@@ -125,7 +108,7 @@ TEST_CASE("when memory runs out in the destructor, the process goes on and no fi
     forEachEditAndFailure([&](Edit const& edit, MemoryPlan const& plan) {
         std::string const old = fileBytes(edit.stored);
         place.write(old);
-        std::string const told = test::toldByChild([&] {
+        std::string const told = toldByChild([&] {
             auto file = std::make_unique<DataFile>(place.path());
             file->open(READ_WRITE);
             insertAll(*file, edit.inserted);
@@ -149,7 +132,7 @@ TEST_CASE("when memory runs out in open, a later open works") {
         CAPTURE(mode);
         forEachEditAndFailure([&](Edit const& edit, MemoryPlan const& plan) {
             std::string const content = fileBytes(edit.stored) + fileBytes(edit.inserted);
-            Entries const expected = test::load(content).entries;
+            Entries const expected = load(content).entries;
             place.write(content);
             DataFile file(place.path());
             std::string const outcome = runOutOfMemory(plan, [&] { file.open(mode); });
@@ -180,7 +163,7 @@ TEST_CASE("when memory runs out in insert or remove, it is done whole or not at 
             CAPTURE(size);
             CAPTURE(inserting);
             Entries expected = numbered(L"k", size, 5);
-            if (inserting) expected.push_back(test::entryOf(longOne));
+            if (inserting) expected.push_back(entryOf(longOne));
             forEachFailure([&](MemoryPlan const& plan) {
                 DataFile file;
                 insertAll(file, numbered(L"k", size, 5));
@@ -195,7 +178,7 @@ TEST_CASE("when memory runs out in insert or remove, it is done whole or not at 
                     (file.*change)(longOne);
                 }
                 checkSameRecords(held(file), expected);
-                CHECK(test::isInOrderOfAddresses(file));
+                CHECK(isInOrderOfAddresses(file));
                 return ranOut;
             });
         }
@@ -203,18 +186,18 @@ TEST_CASE("when memory runs out in insert or remove, it is done whole or not at 
 }
 
 TEST_CASE("when memory runs out in setKey or setData, the record keeps a key and data of its own") {
-    Entry const before = test::entry(L"before", "old");
-    Entry const after{std::wstring(500, L'k'), test::Bytes(500, 'd')};
+    Entry const before = entry(L"before", "old");
+    Entry const after{std::wstring(500, L'k'), Bytes(500, 'd')};
     forEachFailure([&](MemoryPlan const& plan) {
         Record r(before.key, before.data);
         std::string const outcome = runOutOfMemory(plan, [&] { r.setKey(after.key); });
-        checkSame({test::entryOf(r)}, {{outcome == "done" ? after.key : before.key, before.data}});
+        checkSame({entryOf(r)}, {{outcome == "done" ? after.key : before.key, before.data}});
         return memoryRanOut();
     });
     forEachFailure([&](MemoryPlan const& plan) {
         Record r(before.key, before.data);
         std::string const outcome = runOutOfMemory(plan, [&] { r.setData(after.data); });
-        checkSame({test::entryOf(r)}, {{before.key, outcome == "done" ? after.data : before.data}});
+        checkSame({entryOf(r)}, {{before.key, outcome == "done" ? after.data : before.data}});
         return memoryRanOut();
     });
 }

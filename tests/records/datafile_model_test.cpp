@@ -5,6 +5,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <functional>
+#include <iterator>
 #include <map>
 #include <random>
 #include <stdexcept>
@@ -16,20 +17,8 @@
 #include "records/recordfixture.h"
 #include "support/throws.h"
 
+using namespace test;
 using Koru::DataFile;
-using test::Bytes;
-using test::checkSame;
-using test::checkSameRecords;
-using test::Entries;
-using test::Entry;
-using test::fileBytes;
-using test::held;
-using test::isInOrderOfAddresses;
-using test::messageOf;
-using test::Place;
-using test::READ;
-using test::READ_WRITE;
-using test::sameKey;
 using Record = Koru::DataFile::Record;
 
 namespace {
@@ -71,136 +60,129 @@ Bytes randomData(Chance& chance, std::size_t most) {
     return data;
 }
 
-/// A record with a key that can be set, as it is stored.
+/// A record whose key was set, which is tried until one is not refused.
 Record randomRecord(Chance& chance, std::size_t mostData) {
     Record result;
     result.setData(randomData(chance, mostData));
-    for (;;) {
+    while (result.getKey().empty()) {
         std::wstring const key = randomKey(chance);
         std::wstring stored;
-        try {
-            stored = test::storedKey(key);
-        } catch (std::invalid_argument const&) {
-            CHECK(messageOf<std::invalid_argument>([&] { result.setKey(key); }) ==
-                  "zero length key");
-            continue;
-        }
-        result.setKey(key);
-        if (result.getKey() != stored) test::checkKey(result.getKey(), stored);
-        return result;
+        std::string const expected =
+            messageOf<std::invalid_argument>([&] { stored = storedKey(key); });
+        std::string const message = messageOf<std::invalid_argument>([&] { result.setKey(key); });
+        if (message == expected && result.getKey() == stored) continue;
+        CHECK(message == expected);
+        checkKey(result.getKey(), stored);
     }
+    return result;
 }
 
-/// The records by their addresses: the order of positions.
-class Model {
+/// A record file beside what it should hold: the records by their addresses, whose order is that of
+/// the positions.
+class Pair {
 public:
-    std::map<Record const*, Entry, std::less<>> records;
+    Pair() : file_(place_.path()) { file_.open(READ_WRITE); }
 
-    std::map<Record const*, Entry, std::less<>>::iterator find(std::wstring const& key) {
-        return std::find_if(records.begin(), records.end(),
+    void insert(Record const& record) {
+        bool const isNew = find(record.getKey()) == records_.end();
+        file_.insert(record);
+        int newcomers = 0;
+        for (unsigned long i = 0; i < file_.size(); ++i) {
+            if (records_.emplace(&file_[i], entryOf(record)).second) ++newcomers;
+        }
+        CHECK(newcomers == (isNew ? 1 : 0));
+    }
+
+    void remove(Record const& record) {
+        auto const found = find(record.getKey());
+        if (found != records_.end()) records_.erase(found);
+        file_.remove(record);
+    }
+
+    void removeHeld(Chance& chance) {
+        if (!records_.empty()) remove(Record(file_[anyPosition(chance)]));
+    }
+
+    void change(Chance& chance, Record const& record) {
+        if (records_.empty()) return;
+        Record& changed = file_[anyPosition(chance)];
+        changed.setKey(record.getKey());
+        changed.setData(record.getData());
+        records_[&changed] = entryOf(record);
+    }
+
+    /// Writes and reads again; a key that does not come back ends the reading.
+    void synchronize() {
+        std::string const content = fileBytes(expected());
+        Loaded const reloaded = load(content);
+        std::string const message = messageOf<std::exception>([&] { file_.synchronize(); });
+        CHECK((message == "<nothing>") == (reloaded.message == "<nothing>"));
+        bool const same = place_.bytes() == content;
+        CHECK(same);
+        records_.clear();
+        for (unsigned long i = 0; i < file_.size(); ++i) {
+            records_.emplace(&file_[i], entryOf(file_[i]));
+        }
+        checkSameRecords(held(file_), reloaded.entries);
+    }
+
+    /// Positions, addresses and content are as expected.
+    void compare() {
+        REQUIRE(file_.size() == records_.size());
+        unsigned long i = 0;
+        for (auto const& r : records_) {
+            Record const& actual = file_[i++];
+            if (&actual != r.first) CHECK(&actual == r.first);
+            if (!(entryOf(actual) == r.second)) checkSame({entryOf(actual)}, {r.second});
+        }
+    }
+
+    void close() {
+        file_.close();
+        bool const same = place_.bytes() == fileBytes(expected());
+        CHECK(same);
+    }
+
+private:
+    using Held = std::map<Record const*, Entry, std::less<>>;
+
+    Held::iterator find(std::wstring const& key) {
+        return std::find_if(records_.begin(), records_.end(),
                             [&](auto const& r) { return sameKey(r.second.key, key); });
     }
-    Entries entries() const {
+    unsigned long anyPosition(Chance& chance) {
+        return static_cast<unsigned long>(chance.below(records_.size()));
+    }
+    Entries expected() const {
         Entries result;
-        for (auto const& r : records) result.push_back(r.second);
+        for (auto const& r : records_) result.push_back(r.second);
         return result;
     }
-    /// Takes over what the file holds after it was read.
-    void adopt(DataFile& file) {
-        records.clear();
-        for (unsigned long i = 0; i < file.size(); ++i) {
-            records.emplace(&file[i], test::entryOf(file[i]));
-        }
-    }
+
+    Place place_;
+    DataFile file_;
+    Held records_;
 };
-
-/// The one record of the file that the model does not know.
-Record const* newcomer(DataFile& file, Model const& model) {
-    Record const* found = nullptr;
-    for (unsigned long i = 0; i < file.size(); ++i) {
-        if (model.records.count(&file[i]) != 0) continue;
-        CHECK(found == nullptr);
-        found = &file[i];
-    }
-    return found;
-}
-
-/// Positions, addresses and content are the model's.
-void compare(DataFile& file, Model const& model) {
-    REQUIRE(file.size() == model.records.size());
-    unsigned long i = 0;
-    for (auto const& r : model.records) {
-        if (&file[i] != r.first) CHECK(&file[i] == r.first);
-        if (!(test::entryOf(file[i]) == r.second)) {
-            checkSame({test::entryOf(file[i])}, {r.second});
-        }
-        ++i;
-    }
-}
-
-void insert(DataFile& file, Model& model, Record const& record) {
-    bool const isNew = model.find(record.getKey()) == model.records.end();
-    file.insert(record);
-    Record const* const added = newcomer(file, model);
-    CHECK((added != nullptr) == isNew);
-    if (added != nullptr) model.records.emplace(added, test::entryOf(record));
-}
-
-void remove(DataFile& file, Model& model, Record const& record) {
-    auto const found = model.find(record.getKey());
-    if (found != model.records.end()) model.records.erase(found);
-    file.remove(record);
-}
-
-void changeOne(DataFile& file, Model& model, Chance& chance, Record const& record) {
-    if (file.size() == 0) return;
-    Record& changed = file[static_cast<unsigned long>(chance.below(file.size()))];
-    changed.setKey(record.getKey());
-    changed.setData(record.getData());
-    model.records[&changed] = test::entryOf(record);
-}
-
-/// Writes and reads again; a key that does not come back ends the reading.
-void synchronize(Place const& place, DataFile& file, Model& model) {
-    std::string const content = fileBytes(model.entries());
-    test::Loaded const expected = test::load(content);
-    std::string const message = messageOf<std::exception>([&] { file.synchronize(); });
-    CHECK((message == "<nothing>") == (expected.message == "<nothing>"));
-    bool const same = place.bytes() == content;
-    CHECK(same);
-    model.adopt(file);
-    checkSameRecords(held(file), expected.entries);
-}
 
 } // namespace
 
 TEST_CASE("any sequence of operations gives what the model gives, position by position") {
-    Place const place;
     for (std::uint32_t seed = 1; seed <= 30; ++seed) {
         CAPTURE(seed);
         Chance chance(seed);
-        place.write("");
-        DataFile file(place.path());
-        file.open(READ_WRITE);
-        Model model;
+        Pair pair;
         for (int step = 0; step < 150; ++step) {
             CAPTURE(step);
             Record const record = randomRecord(chance, 20000);
             std::size_t const choice = chance.below(100);
-            if (choice < 60) insert(file, model, record);
-            if (choice >= 60 && choice < 75) remove(file, model, record);
-            if (choice >= 75 && choice < 85) changeOne(file, model, chance, record);
-            if (choice >= 85 && choice < 98 && !model.records.empty()) {
-                auto const at = std::next(model.records.begin(),
-                                          static_cast<long>(chance.below(model.records.size())));
-                remove(file, model, Record(*at->first));
-            }
-            if (choice >= 98) synchronize(place, file, model);
-            compare(file, model);
+            if (choice < 60) pair.insert(record);
+            if (choice >= 60 && choice < 75) pair.remove(record);
+            if (choice >= 75 && choice < 85) pair.change(chance, record);
+            if (choice >= 85 && choice < 98) pair.removeHeld(chance);
+            if (choice >= 98) pair.synchronize();
+            pair.compare();
         }
-        file.close();
-        bool const same = place.bytes() == fileBytes(model.entries());
-        CHECK(same);
+        pair.close();
     }
 }
 
@@ -209,9 +191,8 @@ TEST_CASE("records that nobody looks at are inserted and removed as the model sa
     for (std::uint32_t seed = 100; seed < 110; ++seed) {
         CAPTURE(seed);
         Chance chance(seed);
-        place.write("");
         DataFile file(place.path());
-        file.open(READ_WRITE);
+        file.open(WRITE);
         Entries model; // no two with equal keys, so the order does not matter
         for (int step = 0; step < 1500; ++step) {
             Record const record = randomRecord(chance, 300);
@@ -220,7 +201,7 @@ TEST_CASE("records that nobody looks at are inserted and removed as the model sa
             });
             if (!chance.oneIn(3)) {
                 file.insert(record);
-                if (found == model.end()) model.push_back(test::entryOf(record));
+                if (found == model.end()) model.push_back(entryOf(record));
             } else {
                 file.remove(record);
                 if (found != model.end()) model.erase(found);
@@ -228,17 +209,10 @@ TEST_CASE("records that nobody looks at are inserted and removed as the model sa
             if (file.size() != model.size()) REQUIRE(file.size() == model.size());
         }
         CHECK(model.size() > 100);
-        file.setMode(Koru::File::WRITE);
-        Entries const before = seed % 2 == 0 ? held(file) : Entries();
+        if (seed % 2 == 0) checkSameRecords(held(file), model);
         file.close();
         std::string const content = place.bytes();
-        if (seed % 2 == 0) {
-            checkSameRecords(before, model);
-            bool const same = content == fileBytes(before);
-            CHECK(same);
-        }
         CHECK(content.size() == fileBytes(model).size());
-        // Each entry of the model is somewhere in the file.
         for (Entry const& e : model) {
             if (content.find(fileBytes(e)) == std::string::npos) checkSame({e}, {});
         }
@@ -250,27 +224,18 @@ TEST_CASE("records of up to 1 MiB with keys of every low byte are written and re
     for (std::uint32_t seed = 200; seed < 206; ++seed) {
         CAPTURE(seed);
         Chance chance(seed);
-        DataFile file(place.path());
-        file.open(Koru::File::WRITE);
-        for (int i = 0; i < 25; ++i) file.insert(randomRecord(chance, (1U << 20) + 1));
-        Entries const entries = held(file);
-        file.close();
-        std::string const content = place.bytes();
-        bool const same = content == fileBytes(entries);
-        CHECK(same);
-        test::Loaded const expected = test::load(content);
-        std::string const message = messageOf<std::exception>([&] { file.open(READ); });
-        CHECK((message == "<nothing>") == (expected.message == "<nothing>"));
-        checkSameRecords(held(file), expected.entries);
-        CHECK(isInOrderOfAddresses(file));
+        Entries entries;
+        for (int i = 0; i < 25; ++i) {
+            entries.push_back(entryOf(randomRecord(chance, (1U << 20) + 1)));
+        }
+        CHECK(writeAndRead(place, entries) > 15);
     }
 }
 
 TEST_CASE("a file of any bytes is read as the model reads it") {
-    Place const place;
     Chance chance(300);
+    std::vector<std::string> contents;
     for (int round = 0; round < 1500; ++round) {
-        CAPTURE(round);
         Entries entries;
         for (std::size_t i = chance.below(5); i > 0; --i) {
             entries.push_back({randomKey(chance), randomData(chance, 100)});
@@ -282,13 +247,7 @@ TEST_CASE("a file of any bytes is read as the model reads it") {
             byte = static_cast<char>(byte ^ (1 << chance.below(2)));
         }
         if (chance.oneIn(4)) content.resize(chance.below(content.size() + 1));
-        test::Loaded const expected = test::load(content);
-        place.write(content);
-        DataFile file(place.path());
-        std::string message = messageOf<std::exception>([&] { file.open(READ); });
-        std::size_t const typeEnd = message.find("> ");
-        if (typeEnd != std::string::npos) message.erase(0, typeEnd + 2);
-        CHECK(message == expected.message);
-        checkSameRecords(held(file), expected.entries);
+        contents.push_back(content);
     }
+    checkFaultless(contents);
 }

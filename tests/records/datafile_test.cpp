@@ -25,29 +25,9 @@
 #include "support/slots.h"
 #include "support/throws.h"
 
+using namespace test;
 using Koru::DataFile;
 using Koru::File;
-using test::BINARY;
-using test::Bytes;
-using test::bytes;
-using test::checkKey;
-using test::checkSame;
-using test::checkSameRecords;
-using test::Entries;
-using test::Entry;
-using test::entry;
-using test::fileBytes;
-using test::held;
-using test::isFree;
-using test::isInOrderOfAddresses;
-using test::messageOf;
-using test::NO_KEY;
-using test::Place;
-using test::READ;
-using test::READ_WRITE;
-using test::record;
-using test::slotOf;
-using test::WRITE;
 using Record = Koru::DataFile::Record;
 using namespace std::string_literals;
 
@@ -70,11 +50,9 @@ Entries numberedEntries(int count) {
     return entries;
 }
 
-void insertNumbered(DataFile& file, int count) { test::insertAll(file, numberedEntries(count)); }
+void insertNumbered(DataFile& file, int count) { insertAll(file, numberedEntries(count)); }
 
 } // namespace
-
-// ------------------------------------------------------------------------------------ the record
 
 TEST_CASE("size and positions have the types of the interface") {
     using Size = decltype(std::declval<DataFile const&>().size());
@@ -133,19 +111,19 @@ TEST_CASE("setKey trims blanks, tabs and line feeds, unless there is nothing els
         Record changed;
         changed.setKey(row.key);
         checkKey(changed.getKey(), row.stored);
-        checkSame({test::entryOf(record(row.key, "data"))}, {entry(row.stored, "data")});
+        checkSame({entryOf(record(row.key, "data"))}, {entry(row.stored, "data")});
     }
 }
 
 TEST_CASE("a key that is empty or begins with NUL is refused and changes nothing") {
     for (std::wstring const& key :
          {L""s, L"\0"s, L"\0a"s, L" \t\0"s, L"\n\0 "s, L"  \0a  "s, L"\0\0"s}) {
-        CAPTURE(test::shown(key));
+        CAPTURE(shown(key));
         CHECK(complaintAboutKey([&] { Record const made(key, bytes("x")); }) == NO_KEY);
         for (Record changed : {record(L"before", "data"), Record()}) {
-            Entry const before = test::entryOf(changed);
+            Entry const before = entryOf(changed);
             CHECK(complaintAboutKey([&] { changed.setKey(key); }) == NO_KEY);
-            checkSame({test::entryOf(changed)}, {before});
+            checkSame({entryOf(changed)}, {before});
         }
     }
 }
@@ -160,10 +138,10 @@ TEST_CASE("every key of up to five characters is trimmed or refused as the plain
     for (std::wstring const& key : keys) {
         std::wstring stored = L"before";
         Record changed(stored, {});
-        std::string const expected = complaintAboutKey([&] { stored = test::storedKey(key); });
+        std::string const expected = complaintAboutKey([&] { stored = storedKey(key); });
         std::string const message = complaintAboutKey([&] { changed.setKey(key); });
         if (message == expected && changed.getKey() == stored) continue;
-        CAPTURE(test::shown(key));
+        CAPTURE(shown(key));
         REQUIRE(message == expected);
         checkKey(changed.getKey(), stored);
     }
@@ -175,17 +153,17 @@ TEST_CASE("a record may be given its own key and data") {
     r.setData(r.getData());
     Record const& itself = r;
     r = itself;
-    checkSame({test::entryOf(r)}, {entry(L"key", "data")});
+    checkSame({entryOf(r)}, {entry(L"key", "data")});
 }
 
 TEST_CASE("a default record is empty and unchecked, and data is stored as it is") {
     Record r;
-    checkSame({test::entryOf(r)}, {entry(L"")});
+    checkSame({entryOf(r)}, {entry(L"")});
     Bytes all;
     for (int i = 0; i < 256; ++i) all.push_back(static_cast<unsigned char>(i));
     for (Bytes const& data : {all, Bytes()}) {
         r.setData(data);
-        checkSame({test::entryOf(r)}, {{L"", data}});
+        checkSame({entryOf(r)}, {{L"", data}});
     }
 }
 
@@ -204,15 +182,13 @@ TEST_CASE("records are copied member by member, without checks, and apart from t
     Record const empty;
     Record assigned(L"key", bytes("data"));
     assigned = empty;
-    checkSame({test::entryOf(Record(empty)), test::entryOf(assigned)}, {entry(L""), entry(L"")});
+    checkSame({entryOf(Record(empty)), entryOf(assigned)}, {entry(L""), entry(L"")});
     Record const original(L"key", bytes("data"));
     Record apart(original);
     apart.setKey(L"other");
     apart.setData({});
-    checkSame({test::entryOf(original)}, {entry(L"key", "data")});
+    checkSame({entryOf(original)}, {entry(L"key", "data")});
 }
-
-// ------------------------------------------------------------------------------------- positions
 
 TEST_CASE("positions follow the addresses of the records, whatever was done before") {
     Place const place;
@@ -253,7 +229,7 @@ TEST_CASE("a record stays where it is until it is removed, whatever happens to o
     Entries kept;
     Entries expected;
     for (std::size_t i = 1; i < records.size(); i += 2) {
-        kept.push_back(test::entryOf(*records[i]));
+        kept.push_back(entryOf(*records[i]));
         expected.push_back(entry(numbered(static_cast<int>(i)), std::to_string(i)));
     }
     checkSame(kept, expected);
@@ -270,7 +246,7 @@ TEST_CASE("records are written in the order of their positions") {
     for (int i = 0; i < 300; i += 8) file.insert(record(numbered(i), "again"));
     Entries const entries = held(file);
     file.close();
-    checkSame(test::load(place.bytes()).entries, entries);
+    checkSame(load(place.bytes()).entries, entries);
 }
 
 TEST_CASE("a position after the last is refused") {
@@ -290,8 +266,6 @@ TEST_CASE("a position after the last is refused") {
     }
     CHECK(isFree(file));
 }
-
-// ------------------------------------------------------------------------------- insert and remove
 
 TEST_CASE("a record with an equal key is not inserted, and the one held stays as it is") {
     DataFile file;
@@ -355,9 +329,8 @@ TEST_CASE("remove removes the first record of an equal key, and nothing without 
     Entries expected = held(file);
     REQUIRE(expected.size() == 20);
     for (int i = 0; i < 12; ++i) {
-        auto const first = std::find_if(expected.begin(), expected.end(), [](Entry const& e) {
-            return test::sameKey(e.key, L"name");
-        });
+        auto const first = std::find_if(expected.begin(), expected.end(),
+                                        [](Entry const& e) { return sameKey(e.key, L"name"); });
         if (first != expected.end()) expected.erase(first);
         file.remove(record(L"NAME"));
         checkSame(held(file), expected);
@@ -408,7 +381,7 @@ struct Step {
 void checkSteps(DataFile& file, std::vector<Step> const& steps) {
     auto size = static_cast<long>(file.size());
     for (Step const& step : steps) {
-        CAPTURE(test::shown(step.key));
+        CAPTURE(shown(step.key));
         (file.*step.change)(record(step.key));
         size += step.difference;
         CHECK(file.size() == static_cast<unsigned long>(size));
@@ -584,8 +557,6 @@ TEST_CASE("of many records the equal one is found, and only that") {
     for (Record const& r : each(L"new ", 500, 1)) file.insert(r);
     CHECK(file.size() == static_cast<unsigned long>(count));
 }
-
-// -------------------------------------------------------------------------------------- the lock
 
 TEST_CASE("an exception of the record file's own leaves the lock free") {
     Place const place;

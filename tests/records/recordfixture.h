@@ -6,12 +6,16 @@
 #include <doctest/doctest.h>
 
 #include <pthread.h>
+#include <sys/resource.h>
+#include <unistd.h>
 #include <wchar.h>
 
 #include <algorithm>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <cstdio>
+#include <fstream>
 #include <functional>
 #include <future>
 #include <new>
@@ -23,6 +27,7 @@
 #include <koru/datafile.h>
 
 #include "support/shown.h"
+#include "support/subprocess.h"
 #include "support/tempdir.h"
 
 namespace test {
@@ -62,8 +67,6 @@ inline Koru::DataFile::Record record(std::wstring const& key, std::string const&
 }
 
 inline Entry entryOf(Koru::DataFile::Record const& held) { return {held.getKey(), held.getData()}; }
-
-// ---------------------------------------------------------------------------- what is expected
 
 /// Whether keys are equal: as the C library compares them, up to the first NUL.
 inline bool sameKey(std::wstring const& a, std::wstring const& b) {
@@ -143,8 +146,6 @@ inline Loaded load(std::string rest) {
     }
     return result;
 }
-
-// ------------------------------------------------------------------------------- what there is
 
 /// The records held, by position.
 inline Entries held(Koru::DataFile& file) {
@@ -234,6 +235,77 @@ inline bool isFree(Koru::File& file) {
     if (!finished) ::pthread_cancel(other.native_handle());
     other.join();
     return finished && result.get();
+}
+
+/// Writes these records and reads them again, both as the plain rules say. Returns how many were
+/// written, one of those with equal keys.
+inline std::size_t writeAndRead(Place const& place, Entries const& entries) {
+    Koru::DataFile file(place.path());
+    file.open(WRITE);
+    insertAll(file, entries);
+    Entries const inserted = held(file);
+    file.close();
+    bool const same = place.bytes() == fileBytes(inserted);
+    CHECK(same);
+    Loaded const expected = load(fileBytes(inserted));
+    CHECK(openMessage(file, READ) == expected.message);
+    checkSameRecords(held(file), expected.entries);
+    CHECK(isInOrderOfAddresses(file));
+    return inserted.size();
+}
+
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool MEMORY_CAN_BE_LIMITED = false; // the sanitizers reserve more than any limit allows
+#else
+constexpr bool MEMORY_CAN_BE_LIMITED = true;
+#endif
+
+/// Gives this process 256 MiB more address space than it has now. Only for child processes.
+inline void limitMemory() {
+    if (!MEMORY_CAN_BE_LIMITED) return;
+    std::size_t pages = 0;
+    std::ifstream("/proc/self/statm") >> pages;
+    rlimit limit = {};
+    ::getrlimit(RLIMIT_AS, &limit);
+    limit.rlim_cur = pages * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE)) + (256UL << 20);
+    ::setrlimit(RLIMIT_AS, &limit);
+}
+
+/// Opens a file of these bytes and says what is not as it should be; "" when all is well.
+inline std::string faultWith(Place const& place, std::string const& content) {
+    Loaded const expected = load(content);
+    place.write(content);
+    Koru::DataFile file(place.path());
+    std::string const message = openMessage(file, READ);
+    std::string fault;
+    if (message != expected.message) fault += message + " instead of " + expected.message + ", ";
+    if (!file.is_open()) fault += "not open, ";
+    if (sorted(held(file)) != sorted(expected.entries)) fault += "other records, ";
+    if (!isFree(file)) fault += "still locked, ";
+    // The object can still be used.
+    place.write(fileBytes(entry(L"good", "file")));
+    file.close();
+    file.open(READ);
+    if (file.size() != 1) fault += "not usable, ";
+    return fault;
+}
+
+/// Tries all of these files in a child with little memory.
+inline void checkFaultless(std::vector<std::string> const& contents) {
+    Place const place;
+    REQUIRE(!contents.empty());
+    Outcome const outcome = inChild([&] {
+        ::alarm(250);
+        limitMemory();
+        for (std::string const& content : contents) {
+            std::string const fault = faultWith(place, content);
+            if (!fault.empty()) std::printf("%s: %s\n", shown(content).c_str(), fault.c_str());
+        }
+        std::printf("tried all");
+        return 0;
+    });
+    CHECK(outcome.exitCode == 0);
+    CHECK(outcome.out == "tried all");
 }
 
 } // namespace test
