@@ -1,13 +1,9 @@
 // A record file of any bytes is read up to what is wrong with it, and what was read survives every
 // rewrite.
 #include <koru/datafile.h>
-#include <stdlib.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cstdint>
-#include <fstream>
-#include <iterator>
 #include <new>
 #include <stdexcept>
 #include <string>
@@ -15,32 +11,15 @@
 #include <vector>
 
 #include "check.h"
+#include "scratchfile.h"
 
 namespace {
 
+using fuzz::scratchFile;
 using Koru::DataFile;
 using Koru::File;
 using Bytes = std::vector<unsigned char>;
 using Entries = std::vector<std::pair<std::wstring, Bytes>>;
-
-std::string const& fileName() {
-    static std::string const name = [] {
-        char pattern[] = "/tmp/koru-fuzz-XXXXXX";
-        int const descriptor = ::mkstemp(pattern);
-        KORU_CHECK(descriptor >= 0);
-        ::close(descriptor);
-        static std::string path;
-        path = pattern;
-        std::atexit([] { ::unlink(path.c_str()); });
-        return path;
-    }();
-    return name;
-}
-
-std::string bytesOnDisk() {
-    std::ifstream in(fileName(), std::ios::binary);
-    return {std::istreambuf_iterator<char>(in), {}};
-}
 
 /// The records by position.
 Entries held(DataFile& file) {
@@ -127,25 +106,24 @@ bool opens(DataFile& file) {
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size) {
-    std::ofstream(fileName(), std::ios::binary | std::ios::trunc)
-        .write(reinterpret_cast<char const*>(data), static_cast<std::streamsize>(size));
+    scratchFile().write(data, size);
     std::string rest(data, data + size);
     Entries const expected = completeEntries(rest);
 
-    DataFile file{File::Path(fileName())};
+    DataFile file{File::Path(scratchFile().name())};
     KORU_CHECK(opens(file) == rest.empty());
     KORU_CHECK(file.is_open());
     KORU_CHECK(sorted(held(file)) == sorted(expected));
     for (int rewrite = 0; rewrite < 2; ++rewrite) {
         std::string const bytes = bytesOf(held(file));
         file.close();
-        KORU_CHECK(bytesOnDisk() == bytes);
+        KORU_CHECK(scratchFile().bytes() == bytes);
         KORU_CHECK(opens(file));
         KORU_CHECK(sorted(held(file)) == sorted(expected));
     }
     for (auto const& entry : expected) file.remove(DataFile::Record(entry.first, entry.second));
     KORU_CHECK(file.size() == 0);
     file.close();
-    KORU_CHECK(bytesOnDisk().empty());
+    KORU_CHECK(scratchFile().bytes().empty());
     return 0;
 }

@@ -1,33 +1,18 @@
 // A settings file of any bytes loads, and what a rewrite made of it stays the same in the next one.
 #include <koru/initializationfile.h>
-#include <stdlib.h>
-#include <unistd.h>
 
 #include <cstdint>
-#include <fstream>
 #include <string>
 #include <vector>
 
 #include "check.h"
+#include "scratchfile.h"
 
 namespace {
 
+using fuzz::scratchFile;
 using Koru::File;
 using Koru::InitializationFile;
-
-std::string const& fileName() {
-    static std::string const name = [] {
-        char pattern[] = "/tmp/koru-fuzz-XXXXXX";
-        int const descriptor = ::mkstemp(pattern);
-        KORU_CHECK(descriptor >= 0);
-        ::close(descriptor);
-        static std::string path;
-        path = pattern;
-        std::atexit([] { ::unlink(path.c_str()); });
-        return path;
-    }();
-    return name;
-}
 
 std::vector<std::wstring> contentOf(InitializationFile& file) {
     std::vector<std::wstring> content;
@@ -44,9 +29,8 @@ std::vector<std::wstring> contentOf(InitializationFile& file) {
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size) {
-    std::ofstream(fileName(), std::ios::binary | std::ios::trunc)
-        .write(reinterpret_cast<char const*>(data), static_cast<std::streamsize>(size));
-    InitializationFile file{File::Path(fileName())};
+    scratchFile().write(data, size);
+    InitializationFile file{File::Path(scratchFile().name())};
     file.open(File::READ | File::WRITE);
     // The first rewrite may change the table: an overlong blank or line feed becomes a plain one.
     file.synchronize();
