@@ -135,6 +135,15 @@ private:
     std::string path_;
 };
 
+/// Replaces the file of a store with transactions.
+template <class Store>
+[[maybe_unused]] void _replace(Store& store, std::string const& path, Records const& records) {
+    ::unlink(path.c_str());
+    store.begin();
+    for (Plain const& record : records) store.insert(record);
+    store.commit();
+}
+
 #ifdef KORU_BENCH_HAS_LMDB
 class Lmdb {
 public:
@@ -145,14 +154,7 @@ public:
     Lmdb& operator=(Lmdb const&) = delete;
     ~Lmdb() { abandon(); }
 
-    void write(Records const& records) {
-        ::unlink(path_.c_str());
-        begin();
-        for (Plain const& record : records) insert(record);
-        check(mdb_txn_commit(transaction_));
-        transaction_ = nullptr;
-        mdb_env_close(environment_);
-    }
+    void write(Records const& records) { _replace(*this, path_, records); }
     void load(Records& records) {
         begin(MDB_RDONLY);
         MDB_cursor* cursor;
@@ -180,6 +182,11 @@ public:
         MDB_val data = {record.data.size(), const_cast<unsigned char*>(record.data.data())};
         check(mdb_put(transaction_, database_, &keyBytes, &data, MDB_NOOVERWRITE));
     }
+    void commit() {
+        check(mdb_txn_commit(transaction_));
+        transaction_ = nullptr;
+        mdb_env_close(environment_);
+    }
     void abandon() {
         if (transaction_ == nullptr) return;
         mdb_txn_abort(transaction_);
@@ -194,6 +201,10 @@ private:
     MDB_env* environment_ = nullptr;
     MDB_txn* transaction_ = nullptr;
     MDB_dbi database_ = 0;
+};
+#else
+struct Lmdb : bench::Missing {
+    static constexpr char const* name = "LMDB";
 };
 #endif
 
@@ -243,6 +254,10 @@ private:
 
     std::string path_;
 };
+#else
+struct Gdbm : bench::Missing {
+    static constexpr char const* name = "GDBM";
+};
 #endif
 
 #ifdef KORU_BENCH_HAS_SQLITE
@@ -255,13 +270,7 @@ public:
     Sqlite& operator=(Sqlite const&) = delete;
     ~Sqlite() { abandon(); }
 
-    void write(Records const& records) {
-        ::unlink(path_.c_str());
-        begin();
-        for (Plain const& record : records) insert(record);
-        run("COMMIT");
-        close();
-    }
+    void write(Records const& records) { _replace(*this, path_, records); }
     void load(Records& records) {
         open();
         prepare("SELECT key, data FROM records");
@@ -291,6 +300,10 @@ public:
         bench::require(sqlite3_step(statement_) == SQLITE_DONE, "SQLite: insert");
         sqlite3_reset(statement_);
     }
+    void commit() {
+        run("COMMIT");
+        close();
+    }
     void abandon() {
         if (database_ == nullptr) return;
         run("ROLLBACK");
@@ -319,6 +332,10 @@ private:
     std::string path_;
     sqlite3* database_ = nullptr;
     sqlite3_stmt* statement_ = nullptr;
+};
+#else
+struct Sqlite : bench::Missing {
+    static constexpr char const* name = "SQLite";
 };
 #endif
 
@@ -430,7 +447,7 @@ Work _write(Task const& task) {
 }
 
 template <class Store>
-[[maybe_unused]] Work _insert(Task const& task, Records const& added, bool isTop) {
+Work _insertWork(Task const& task, Records const& added, bool isTop) {
     std::string const path = task.path(Store::name);
     ::unlink(path.c_str());
     if (isTop) Store(path).write(task.records());
@@ -445,6 +462,15 @@ template <class Store>
             for (Plain const& record : added) (*store)->insert(record);
             return 0;
         });
+}
+
+template <class Store>
+Peer _insert(Task const& task, Records const& added, bool isTop) {
+    if constexpr (bench::isMissing<Store>) {
+        return bench::missing(Store::name);
+    } else {
+        return bench::peer(Store::name, _insertWork<Store>(task, added, isTop));
+    }
 }
 
 using Table = std::unordered_map<std::wstring, std::vector<unsigned char>>;
@@ -468,28 +494,17 @@ enum class Step { write, load };
 
 template <class Store>
 Peer _peer(Task const& task, Step step) {
-    return bench::peer(Store::name, step == Step::load ? _load<Store>(task) : _write<Store>(task));
+    if constexpr (bench::isMissing<Store>) {
+        return bench::missing(Store::name);
+    } else {
+        return bench::peer(Store::name,
+                           step == Step::load ? _load<Store>(task) : _write<Store>(task));
+    }
 }
 
 std::vector<Peer> _stores(Task const& task, Step step) {
-    return {
-        _peer<Stdio>(task, step),
-#ifdef KORU_BENCH_HAS_LMDB
-        _peer<Lmdb>(task, step),
-#else
-        bench::missing("LMDB"),
-#endif
-#ifdef KORU_BENCH_HAS_GDBM
-        _peer<Gdbm>(task, step),
-#else
-        bench::missing("GDBM"),
-#endif
-#ifdef KORU_BENCH_HAS_SQLITE
-        _peer<Sqlite>(task, step),
-#else
-        bench::missing("SQLite"),
-#endif
-    };
+    return {_peer<Stdio>(task, step), _peer<Lmdb>(task, step), _peer<Gdbm>(task, step),
+            _peer<Sqlite>(task, step)};
 }
 
 /// The file's bytes in one go, into memory that is there already.
@@ -526,18 +541,8 @@ void _inserts(bench::Report& report, Task const& task, std::string const& name, 
     if (!report.wants(row)) return;
     Records const added = isTop ? _records("another", 1000) : task.records();
     report.compare(row, _ourInsert(task, added, isTop),
-                   {
-#ifdef KORU_BENCH_HAS_LMDB
-                       bench::peer(Lmdb::name, _insert<Lmdb>(task, added, isTop)),
-#else
-                       bench::missing("LMDB"),
-#endif
-#ifdef KORU_BENCH_HAS_SQLITE
-                       bench::peer(Sqlite::name, _insert<Sqlite>(task, added, isTop)),
-#else
-                       bench::missing("SQLite"),
-#endif
-                       bench::limit("unordered_map", _hashMapInsert(task, added, isTop))},
+                   {_insert<Lmdb>(task, added, isTop), _insert<Sqlite>(task, added, isTop),
+                    bench::limit("unordered_map", _hashMapInsert(task, added, isTop))},
                    goal, static_cast<double>(added.size()));
 }
 

@@ -9,11 +9,11 @@
 #include <ctime>
 #include <iomanip>
 #include <ostream>
-#include <random>
 #include <sstream>
 #include <string>
 #include <vector>
 
+#include "circle.h"
 #include "fixedbuffer.h"
 #include "harness.h"
 
@@ -57,123 +57,108 @@ Moment _moment(long seconds) {
     return {seconds, fields, bytes, text, Koru::DateTime(seconds)};
 }
 
-/// Moments that cannot be foreseen, handed out in a circle.
-class Moments {
-public:
-    Moments() {
-        std::mt19937 random(1);
-        for (std::size_t i = 0; i < COUNT; ++i) {
-            moments_.push_back(_moment(static_cast<long>(random() % 2000000000U)));
-        }
-    }
+using Moments = bench::Circle<Moment>;
 
-    Moment const& next() { return moments_[at_++ % COUNT]; }
-    Moment const* begin() const { return moments_.data(); }
-    Moment const* end() const { return moments_.data() + COUNT; }
-
-private:
-    static constexpr std::size_t COUNT = 64;
-
-    std::vector<Moment> moments_;
-    std::size_t at_ = 0;
-};
-
-void _parse(bench::Report& report, Moments moments) {
+void _parse(bench::Report& report, Moments const& moments) {
     for (Moment const& moment : moments) {
         Koru::DateTime const parsed(moment.text);
         bench::require(static_cast<long>(parsed) == static_cast<long>(moment.ours),
                        "the date was read as another one");
     }
-    std::vector<Peer> peers = {bench::peer("strptime", Work::repeated([moments]() mutable {
-                                               std::tm fields{};
-                                               ::strptime(moments.next().text.c_str(), FORMAT,
-                                                          &fields);
-                                               return fields;
-                                           })),
-                               bench::peer("std::get_time", Work::repeated([moments]() mutable {
-                                               std::tm fields{};
-                                               std::istringstream in(moments.next().text);
-                                               in >> std::get_time(&fields, FORMAT);
-                                               return fields;
-                                           }))};
+    Work const ours = moments.each([](Moment const& m) { return Koru::DateTime(m.text); });
+    Work const strptime = moments.each([](Moment const& m) {
+        std::tm fields{};
+        ::strptime(m.text.c_str(), FORMAT, &fields);
+        return fields;
+    });
+    Work const getTime = moments.each([](Moment const& m) {
+        std::tm fields{};
+        std::istringstream in(m.text);
+        in >> std::get_time(&fields, FORMAT);
+        return fields;
+    });
+    report.compare("parse", ours,
+                   {bench::peer("strptime", strptime), bench::peer("std::get_time", getTime),
 #ifdef KORU_BENCH_HAS_BOOST
-    peers.push_back(bench::peer("Boost time_from_string", Work::repeated([moments]() mutable {
-                                    return boost::posix_time::time_from_string(moments.next().text);
-                                })));
+                    bench::peer("Boost time_from_string", moments.each([](Moment const& m) {
+                        return boost::posix_time::time_from_string(m.text);
+                    }))},
 #else
-    peers.push_back(bench::missing("Boost time_from_string"));
+                    bench::missing("Boost time_from_string")},
 #endif
-    report.compare("parse", Work::repeated([moments]() mutable {
-                       return Koru::DateTime(moments.next().text);
-                   }),
-                   peers, 0.4);
+                   0.4);
 }
 
-void _format(bench::Report& report, Moments moments) {
-    for (Moment const& moment : moments) {
-        std::string const text = moment.ours;
-        bench::require(text == moment.text, "the date was written as another one");
-    }
-    std::vector<Peer> peers = {bench::peer("strftime", Work::repeated([moments]() mutable {
-                                               char text[32];
-                                               std::size_t const size =
-                                                   std::strftime(text, sizeof text, FORMAT,
-                                                                 &moments.next().fields);
-                                               return std::string(text, size);
-                                           }))};
+Peer _fmt([[maybe_unused]] Moments const& moments) {
 #ifdef KORU_BENCH_HAS_FMT
-    peers.push_back(bench::peer("fmt::format", Work::repeated([moments]() mutable {
-                                    return fmt::format("{:%F %T}", moments.next().fields);
-                                })));
+    return bench::peer("fmt::format", moments.each([](Moment const& m) {
+        return fmt::format("{:%F %T}", m.fields);
+    }));
 #else
-    peers.push_back(bench::missing("fmt::format"));
+    return bench::missing("fmt::format");
 #endif
+}
+
+Peer _boost([[maybe_unused]] Moments const& moments) {
 #ifdef KORU_BENCH_HAS_BOOST
     std::vector<boost::posix_time::ptime> times;
     for (Moment const& moment : moments) {
         times.push_back(boost::posix_time::ptime_from_tm(moment.fields));
     }
-    peers.push_back(bench::peer("Boost to_iso_extended", Work::repeated([times, at = 0U]() mutable {
-                                    return boost::posix_time::to_iso_extended_string(
-                                        times[at++ % times.size()]);
-                                })));
+    return bench::peer("Boost to_iso_extended", Work::repeated([times, at = 0U]() mutable {
+                           return boost::posix_time::to_iso_extended_string(
+                               times[at++ % times.size()]);
+                       }));
 #else
-    peers.push_back(bench::missing("Boost to_iso_extended"));
+    return bench::missing("Boost to_iso_extended");
 #endif
-    report.compare("format", Work::repeated([moments]() mutable {
-                       std::string text = moments.next().ours;
-                       return text;
-                   }),
-                   peers, 0.5);
 }
 
-void _stream(bench::Report& report, Moments moments) {
+void _format(bench::Report& report, Moments const& moments) {
+    for (Moment const& moment : moments) {
+        std::string const text = moment.ours;
+        bench::require(text == moment.text, "the date was written as another one");
+    }
+    Work const ours = moments.each([](Moment const& m) {
+        std::string text = m.ours;
+        return text;
+    });
+    Work const strftime = moments.each([](Moment const& m) {
+        char text[32];
+        std::size_t const size = std::strftime(text, sizeof text, FORMAT, &m.fields);
+        return std::string(text, size);
+    });
+    report.compare("format", ours,
+                   {bench::peer("strftime", strftime), _fmt(moments), _boost(moments)}, 0.5);
+}
+
+void _stream(bench::Report& report, Moments const& moments) {
     bench::FixedBuffer<char> buffer;
     std::ostream out(&buffer);
-    report.compare("stream", Work::repeated([&] {
-                       buffer.rewind();
-                       out << moments.next().ours;
-                       return 0;
-                   }),
-                   {bench::peer("strftime + <<", Work::repeated([&] {
-                                    char text[32];
-                                    std::strftime(text, sizeof text, FORMAT,
-                                                  &moments.next().fields);
-                                    buffer.rewind();
-                                    out << text;
-                                    return 0;
-                                })),
-                    bench::peer("std::put_time", Work::repeated([&] {
-                                    buffer.rewind();
-                                    out << std::put_time(&moments.next().fields, FORMAT);
-                                    return 0;
-                                })),
-                    bench::limit("sputn of the text", Work::repeated([&] {
-                                     std::string const& text = moments.next().text;
-                                     buffer.rewind();
-                                     return out.rdbuf()->sputn(
-                                         text.data(), static_cast<std::streamsize>(text.size()));
-                                 }))},
+    Work const ours = moments.each([&](Moment const& m) {
+        buffer.rewind();
+        out << m.ours;
+        return 0;
+    });
+    Work const strftime = moments.each([&](Moment const& m) {
+        char text[32];
+        std::strftime(text, sizeof text, FORMAT, &m.fields);
+        buffer.rewind();
+        out << text;
+        return 0;
+    });
+    Work const putTime = moments.each([&](Moment const& m) {
+        buffer.rewind();
+        out << std::put_time(&m.fields, FORMAT);
+        return 0;
+    });
+    Work const sputn = moments.each([&](Moment const& m) {
+        buffer.rewind();
+        return out.rdbuf()->sputn(m.text.data(), static_cast<std::streamsize>(m.text.size()));
+    });
+    report.compare("stream", ours,
+                   {bench::peer("strftime + <<", strftime), bench::peer("std::put_time", putTime),
+                    bench::limit("sputn of the text", sputn)},
                    0.25);
 }
 
@@ -183,36 +168,32 @@ std::time_t _mktime(std::tm fields) {
     return std::mktime(&fields);
 }
 
-void _toEpoch(bench::Report& report, Moments moments) {
+void _toEpoch(bench::Report& report, Moments const& moments) {
     for (Moment const& moment : moments) {
         bench::require(static_cast<long>(moment.ours) == _mktime(moment.fields),
                        "the date became other epoch seconds");
     }
-    report.compare("to epoch", Work::repeated([moments]() mutable {
-                       return static_cast<long>(moments.next().ours);
-                   }),
-                   {bench::peer("mktime", Work::repeated([moments]() mutable {
-                                    return _mktime(moments.next().fields);
-                                }))},
-                   1.02);
+    Work const ours = moments.each([](Moment const& m) { return static_cast<long>(m.ours); });
+    Work const mktime = moments.each([](Moment const& m) { return _mktime(m.fields); });
+    report.compare("to epoch", ours, {bench::peer("mktime", mktime)}, 1.02);
 }
 
-void _fromEpoch(bench::Report& report, Moments moments) {
-    report.compare("from epoch", Work::repeated([moments]() mutable {
-                       return Koru::DateTime(moments.next().seconds);
-                   }),
-                   {bench::limit("localtime", Work::repeated([moments]() mutable {
-                                     std::time_t const moment = moments.next().seconds;
-                                     return *std::localtime(&moment);
-                                 })),
-                    bench::limit("its C library calls", Work::repeated([moments]() mutable {
-                                     std::time_t const moment = moments.next().seconds;
-                                     std::tm fields = *std::localtime(&moment);
-                                     std::time_t const again = std::mktime(&fields);
-                                     fields = *std::gmtime(&again);
-                                     return again - std::mktime(&fields);
-                                 }),
-                                 1.05)});
+void _fromEpoch(bench::Report& report, Moments const& moments) {
+    Work const ours = moments.each([](Moment const& m) { return Koru::DateTime(m.seconds); });
+    Work const localtime = moments.each([](Moment const& m) {
+        std::time_t const moment = m.seconds;
+        return *std::localtime(&moment);
+    });
+    Work const calls = moments.each([](Moment const& m) {
+        std::time_t const moment = m.seconds;
+        std::tm fields = *std::localtime(&moment);
+        std::time_t const again = std::mktime(&fields);
+        fields = *std::gmtime(&again);
+        return again - std::mktime(&fields);
+    });
+    report.compare(
+        "from epoch", ours,
+        {bench::limit("localtime", localtime), bench::limit("its C library calls", calls, 1.05)});
 }
 
 /// Pairs a moment with one that is so many seconds later.
@@ -250,7 +231,8 @@ int main(int argc, char** argv) {
     // The rule itself, so that no zone file has a part in it.
     ::setenv("TZ", "CET-1CEST,M3.5.0,M10.5.0/3", 1);
     ::tzset();
-    Moments const moments;
+    Moments const moments(
+        [](auto& random) { return _moment(static_cast<long>(random() % 2000000000U)); });
     bench::Report report("dates", bench::Options(argc, argv));
     _parse(report, moments);
     _format(report, moments);

@@ -11,6 +11,7 @@
 #include <cstring>
 #include <fstream>
 #include <string>
+#include <type_traits>
 #include <utility>
 #include <vector>
 
@@ -24,7 +25,7 @@ namespace bench {
 struct Peer {
     std::string name;
     Work work;            ///< empty when this machine lacks the library
-    bool isLimit = false; ///< whether it stands beside the contest for the fastest
+    bool isLimit = false; ///< whether it does not count among the fastest
     double goal = 0;      ///< a limit's own goal; 0 for none
 };
 
@@ -35,6 +36,22 @@ inline Peer limit(std::string name, Work work, double goal = 0) {
     return {std::move(name), std::move(work), true, goal};
 }
 inline Peer missing(std::string name) { return {std::move(name), Work(), false, 0}; }
+
+/// The base of a library's class where this machine lacks the library; it has a name only.
+struct Missing {};
+
+template <class Library>
+constexpr bool isMissing = std::is_base_of<Missing, Library>::value;
+
+/// The peer of a library's class, with the work that the function makes of it.
+template <class Library, class Make>
+Peer peerOf(Make make) {
+    if constexpr (isMissing<Library>) {
+        return missing(Library::name);
+    } else {
+        return peer(Library::name, make(Library()));
+    }
+}
 
 /// The command line of a benchmark: `[--quick] [--all] [--rounds=N] [--results=FILE] [filter]`.
 /// Rows whose name contains the filter are run.

@@ -5,8 +5,8 @@
 // to case. SimpleIni (CSimpleIniCaseA with SetUnicode, its variant for narrow UTF-8), GKeyFile and
 // Boost.PropertyTree are narrow and match case exactly, which is less work. To do the same job they
 // are given wide names and asked for wide values, by the library's own conversions; look-ups with
-// narrow names and values stand beside that. Our save deletes the file and writes it anew, as its
-// header says, where the others empty it (GKeyFile writes a temporary file and renames it).
+// narrow names and values are limits. Our save deletes the file and writes a new one, as its header
+// says, where the others empty it (GKeyFile writes a temporary file and renames it).
 #include <koru/initializationfile.h>
 #include <koru/string.h>
 
@@ -166,6 +166,10 @@ private:
     std::string path_;
     CSimpleIniCaseA file_;
 };
+#else
+struct SimpleIni : bench::Missing {
+    static constexpr char const* name = "SimpleIni";
+};
 #endif
 
 #ifdef KORU_BENCH_HAS_BOOST
@@ -197,6 +201,10 @@ private:
 
     std::string path_;
     boost::property_tree::ptree tree_;
+};
+#else
+struct PropertyTree : bench::Missing {
+    static constexpr char const* name = "Boost.PropertyTree";
 };
 #endif
 
@@ -234,6 +242,10 @@ public:
 private:
     std::string path_;
     GKeyFile* file_;
+};
+#else
+struct KeyFile : bench::Missing {
+    static constexpr char const* name = "GLib GKeyFile";
 };
 #endif
 
@@ -274,28 +286,18 @@ public:
 template <class Settings>
 void _add(std::vector<Peer>& peers, Task const& task, Step step) {
     peers.push_back(bench::settingsPeer<Wide<Settings>, Ours>(task, step));
-    if (step != Step::warmGet) return;
-    peers.push_back(bench::limit(std::string(Settings::name) + ", narrow",
-                                 bench::settingsWork<Narrow<Settings>>(task, step)));
+    if constexpr (!bench::isMissing<Settings>) {
+        if (step != Step::warmGet) return;
+        peers.push_back(bench::limit(std::string(Settings::name) + ", narrow",
+                                     bench::settingsWork<Narrow<Settings>>(task, step)));
+    }
 }
 
-std::vector<Peer> _peers([[maybe_unused]] Task const& task, [[maybe_unused]] Step step) {
+std::vector<Peer> _peers(Task const& task, Step step) {
     std::vector<Peer> peers;
-#ifdef KORU_BENCH_HAS_SIMPLEINI
     _add<SimpleIni>(peers, task, step);
-#else
-    peers.push_back(bench::missing("SimpleIni"));
-#endif
-#ifdef KORU_BENCH_HAS_BOOST
     _add<PropertyTree>(peers, task, step);
-#else
-    peers.push_back(bench::missing("Boost.PropertyTree"));
-#endif
-#ifdef KORU_BENCH_HAS_GLIB
     _add<KeyFile>(peers, task, step);
-#else
-    peers.push_back(bench::missing("GLib GKeyFile"));
-#endif
     return peers;
 }
 

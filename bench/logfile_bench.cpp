@@ -129,6 +129,8 @@ private:
 /// One that is used by one thread, as the others are.
 class Spdlog {
 public:
+    static constexpr char const* name = "spdlog";
+
     explicit Spdlog(std::string const& path)
         : log_("", std::make_shared<spdlog::sinks::basic_file_sink_st>(path, true)) {
         log_.set_pattern("%v");
@@ -150,6 +152,10 @@ public:
 private:
     spdlog::logger log_;
     bool stamps_ = false;
+};
+#else
+struct Spdlog : bench::Missing {
+    static constexpr char const* name = "spdlog";
 };
 #endif
 
@@ -182,12 +188,13 @@ Work _work(std::string const& path, Line line) {
         .within(open, close);
 }
 
-bench::Peer _spdlog([[maybe_unused]] std::string const& path, [[maybe_unused]] Line line) {
-#ifdef KORU_BENCH_HAS_SPDLOG
-    return bench::peer("spdlog", _work<Spdlog>(path, line));
-#else
-    return bench::missing("spdlog");
-#endif
+template <class Log>
+bench::Peer _peer(std::string const& path, Line line) {
+    if constexpr (bench::isMissing<Log>) {
+        return bench::missing(Log::name);
+    } else {
+        return bench::peer(Log::name, _work<Log>(path, line));
+    }
 }
 
 /// What DateTime's interface says that it asks the C library for a moment.
@@ -209,16 +216,16 @@ int main(int argc, char** argv) {
     std::string const path = directory / "application.log";
     report.compare("narrow pieces", _work<Ours>(path, Line::narrow),
                    {bench::peer("std::ofstream", _work<Ofstream>(path, Line::narrow)),
-                    _spdlog(path, Line::narrow),
+                    _peer<Spdlog>(path, Line::narrow),
                     bench::limit("fprintf", _work<Fprintf>(path, Line::narrow))},
                    1.02);
     report.compare("narrow pieces, flushed", _work<Ours>(path, Line::flushed),
                    {bench::peer("std::ofstream", _work<Ofstream>(path, Line::flushed)),
-                    _spdlog(path, Line::flushed),
+                    _peer<Spdlog>(path, Line::flushed),
                     bench::limit("fprintf", _work<Fprintf>(path, Line::flushed))});
     report.compare(
         "time stamp and wide pieces", _work<Ours>(path, Line::stamped),
-        {_spdlog(path, Line::stamped),
+        {_peer<Spdlog>(path, Line::stamped),
          bench::limit("std::ofstream + strftime", _work<Ofstream>(path, Line::stamped), 1.2),
          bench::limit("fprintf + strftime", _work<Fprintf>(path, Line::stamped)),
          bench::limit("the stamp's C library calls", Work::repeated(_stampCalls))});

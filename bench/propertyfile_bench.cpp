@@ -3,7 +3,7 @@
 // What is compared: our names and values are wide at the interface, names match without regard to
 // case, and the order of the lines is kept. "unordered_map" is what one writes by hand, with
 // getline and an ofstream, when none of that is asked for: narrow text, exact case, any order. With
-// wide names and values it stands beside that.
+// wide names and values it is a limit.
 #include <koru/propertyfile.h>
 
 #include <cstddef>
@@ -171,20 +171,17 @@ private:
     std::string path_;
     boost::property_tree::ptree tree_;
 };
+#else
+struct PropertyTree : bench::Missing {
+    static constexpr char const* name = "Boost.PropertyTree";
+};
 #endif
 
 std::vector<Peer> _peers(Task const& task, Step step) {
     Peer wide = bench::settingsPeer<WideMap, Ours>(task, step);
     wide.isLimit = true;
-    return {
-        bench::settingsPeer<NarrowMap, Ours>(task, step),
-#ifdef KORU_BENCH_HAS_BOOST
-        bench::settingsPeer<PropertyTree, Ours>(task, step),
-#else
-        bench::missing("Boost.PropertyTree"),
-#endif
-        wide,
-    };
+    return {bench::settingsPeer<NarrowMap, Ours>(task, step),
+            bench::settingsPeer<PropertyTree, Ours>(task, step), wide};
 }
 
 void _size(bench::Report& report, bench::MemoryDirectory const& directory, std::size_t entries,

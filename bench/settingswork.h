@@ -219,12 +219,16 @@ Work settingsWork(SettingsTask<Name> const& task, SettingsStep step) {
 /// The work of a library that finds what ours does; the program ends if it does not.
 template <class Settings, class Ours, class Name>
 Peer settingsPeer(SettingsTask<Name> const& task, SettingsStep step) {
-    SettingsSlot<Ours, Name> ours(task);
-    SettingsSlot<Settings, Name> theirs(task);
-    ours.makeAndLoad();
-    theirs.makeAndLoad();
-    require(ours.get(task.gets()) == theirs.get(task.gets()), Settings::name);
-    return peer(Settings::name, settingsWork<Settings>(task, step));
+    if constexpr (isMissing<Settings>) {
+        return missing(Settings::name);
+    } else {
+        SettingsSlot<Ours, Name> ours(task);
+        SettingsSlot<Settings, Name> theirs(task);
+        ours.makeAndLoad();
+        theirs.makeAndLoad();
+        require(ours.get(task.gets()) == theirs.get(task.gets()), Settings::name);
+        return peer(Settings::name, settingsWork<Settings>(task, step));
+    }
 }
 
 /// Ratios to reach against the fastest peer and, at load and save, the limit; 0 for none.

@@ -137,89 +137,94 @@ Peer _converter(char const* name, Result const& expected, Convert convert) {
     return bench::peer(name, Work::repeated(convert));
 }
 
+#ifdef KORU_BENCH_HAS_BOOST
+struct Boost {
+    static constexpr char const* name = "Boost.Locale utf_to_utf";
+    static std::wstring decode(Sample const& s) {
+        return boost::locale::conv::utf_to_utf<wchar_t>(s.narrow);
+    }
+    static std::string encode(Sample const& s) {
+        return boost::locale::conv::utf_to_utf<char>(s.wide);
+    }
+};
+#else
+struct Boost : bench::Missing {
+    static constexpr char const* name = "Boost.Locale utf_to_utf";
+};
+#endif
+
 #ifdef KORU_BENCH_HAS_ICU
 /// By way of UTF-16, which is what ICU converts from and to.
-std::wstring _icuDecode(Sample& s) {
-    UErrorCode error = U_ZERO_ERROR;
-    std::int32_t units = 0;
-    std::int32_t size = 0;
-    u_strFromUTF8(s.utf16.data(), static_cast<std::int32_t>(s.utf16.size()), &units,
-                  s.narrow.data(), static_cast<std::int32_t>(s.narrow.size()), &error);
-    u_strToWCS(s.wideBuffer.data(), static_cast<std::int32_t>(s.wideBuffer.size()), &size,
-               s.utf16.data(), units, &error);
-    return std::wstring(s.wideBuffer.data(), static_cast<std::size_t>(size));
-}
+struct Icu {
+    static constexpr char const* name = "ICU";
+    static std::wstring decode(Sample& s) {
+        UErrorCode error = U_ZERO_ERROR;
+        std::int32_t units = 0;
+        std::int32_t size = 0;
+        u_strFromUTF8(s.utf16.data(), sizeOf(s.utf16), &units, s.narrow.data(), sizeOf(s.narrow),
+                      &error);
+        u_strToWCS(s.wideBuffer.data(), sizeOf(s.wideBuffer), &size, s.utf16.data(), units, &error);
+        return std::wstring(s.wideBuffer.data(), static_cast<std::size_t>(size));
+    }
+    static std::string encode(Sample& s) {
+        UErrorCode error = U_ZERO_ERROR;
+        std::int32_t units = 0;
+        std::int32_t size = 0;
+        u_strFromWCS(s.utf16.data(), sizeOf(s.utf16), &units, s.wide.data(), sizeOf(s.wide),
+                     &error);
+        u_strToUTF8(s.narrowBuffer.data(), sizeOf(s.narrowBuffer), &size, s.utf16.data(), units,
+                    &error);
+        return std::string(s.narrowBuffer.data(), static_cast<std::size_t>(size));
+    }
 
-std::string _icuEncode(Sample& s) {
-    UErrorCode error = U_ZERO_ERROR;
-    std::int32_t units = 0;
-    std::int32_t size = 0;
-    u_strFromWCS(s.utf16.data(), static_cast<std::int32_t>(s.utf16.size()), &units, s.wide.data(),
-                 static_cast<std::int32_t>(s.wide.size()), &error);
-    u_strToUTF8(s.narrowBuffer.data(), static_cast<std::int32_t>(s.narrowBuffer.size()), &size,
-                s.utf16.data(), units, &error);
-    return std::string(s.narrowBuffer.data(), static_cast<std::size_t>(size));
-}
-#endif
-
-Peer _icuDecoder([[maybe_unused]] Sample& s) {
-#ifdef KORU_BENCH_HAS_ICU
-    return _converter("ICU", s.wide, [&s] { return _icuDecode(s); });
+private:
+    template <class Text>
+    static std::int32_t sizeOf(Text const& text) {
+        return static_cast<std::int32_t>(text.size());
+    }
+};
 #else
-    return bench::missing("ICU");
+struct Icu : bench::Missing {
+    static constexpr char const* name = "ICU";
+};
 #endif
-}
 
-Peer _icuEncoder([[maybe_unused]] Sample& s) {
-#ifdef KORU_BENCH_HAS_ICU
-    return _converter("ICU", s.narrow, [&s] { return _icuEncode(s); });
-#else
-    return bench::missing("ICU");
-#endif
-}
-
-Peer _boostDecoder([[maybe_unused]] Sample const& s) {
-#ifdef KORU_BENCH_HAS_BOOST
-    return _converter("Boost.Locale utf_to_utf", s.wide,
-                      [&s] { return boost::locale::conv::utf_to_utf<wchar_t>(s.narrow); });
-#else
-    return bench::missing("Boost.Locale utf_to_utf");
-#endif
-}
-
-Peer _boostEncoder([[maybe_unused]] Sample const& s) {
-#ifdef KORU_BENCH_HAS_BOOST
-    return _converter("Boost.Locale utf_to_utf", s.narrow,
-                      [&s] { return boost::locale::conv::utf_to_utf<char>(s.wide); });
-#else
-    return bench::missing("Boost.Locale utf_to_utf");
-#endif
-}
-
-Peer _utfcppDecoder([[maybe_unused]] Sample const& s) {
 #ifdef KORU_BENCH_HAS_UTFCPP
-    return _converter("utfcpp utf8to32", s.wide, [&s] {
+struct Utfcpp {
+    static constexpr char const* name = "utfcpp";
+    static std::wstring decode(Sample const& s) {
         std::wstring result;
         result.reserve(s.narrow.size());
         utf8::utf8to32(s.narrow.begin(), s.narrow.end(), std::back_inserter(result));
         return result;
-    });
-#else
-    return bench::missing("utfcpp utf8to32");
-#endif
-}
-
-Peer _utfcppEncoder([[maybe_unused]] Sample const& s) {
-#ifdef KORU_BENCH_HAS_UTFCPP
-    return _converter("utfcpp utf32to8", s.narrow, [&s] {
+    }
+    static std::string encode(Sample const& s) {
         std::string result;
         result.reserve(s.wide.size());
         utf8::utf32to8(s.wide.begin(), s.wide.end(), std::back_inserter(result));
         return result;
-    });
+    }
+};
 #else
-    return bench::missing("utfcpp utf32to8");
+struct Utfcpp : bench::Missing {
+    static constexpr char const* name = "utfcpp";
+};
 #endif
+
+template <class Library>
+Peer _decoder(Sample& s) {
+    return bench::peerOf<Library>([&s](auto library) {
+        bench::require(library.decode(s) == s.wide, library.name);
+        return Work::repeated([&s, library] { return library.decode(s); });
+    });
+}
+
+template <class Library>
+Peer _encoder(Sample& s) {
+    return bench::peerOf<Library>([&s](auto library) {
+        bench::require(library.encode(s) == s.narrow, library.name);
+        return Work::repeated([&s, library] { return library.encode(s); });
+    });
 }
 
 Peer _libraryDecoder(Sample& s) {
@@ -261,9 +266,9 @@ void _decode(bench::Report& report, std::string const& row, Sample& s, Goals goa
     Iconv converter("WCHAR_T", "UTF-8");
     report.compare(
         row, Work::repeated([&s] { return Koru::make_wstring(s.narrow); }),
-        {_boostDecoder(s),
+        {_decoder<Boost>(s),
          _converter("iconv", s.wide, [&] { return converter.convert(s.narrow, s.wideBuffer); }),
-         _icuDecoder(s), bench::peer("Qt", bench::qtDecode(s.narrow)), _utfcppDecoder(s),
+         _decoder<Icu>(s), bench::peer("Qt", bench::qtDecode(s.narrow)), _decoder<Utfcpp>(s),
          _libraryDecoder(s), _move(s, goals.limit)},
         goals.peer);
 }
@@ -273,9 +278,9 @@ void _encode(bench::Report& report, std::string const& row, Sample& s, Goals goa
     Iconv converter("UTF-8", "WCHAR_T");
     report.compare(
         row, Work::repeated([&s] { return Koru::make_string(s.wide); }),
-        {_boostEncoder(s),
+        {_encoder<Boost>(s),
          _converter("iconv", s.narrow, [&] { return converter.convert(s.wide, s.narrowBuffer); }),
-         _icuEncoder(s), bench::peer("Qt", bench::qtEncode(s.wide)), _utfcppEncoder(s),
+         _encoder<Icu>(s), bench::peer("Qt", bench::qtEncode(s.wide)), _encoder<Utfcpp>(s),
          _libraryEncoder(s), _move(s, goals.limit)},
         goals.peer);
 }

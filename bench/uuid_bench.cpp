@@ -5,10 +5,10 @@
 #include <array>
 #include <cstring>
 #include <ostream>
-#include <random>
 #include <string>
 #include <vector>
 
+#include "circle.h"
 #include "fixedbuffer.h"
 #include "harness.h"
 #include "qt.h"
@@ -48,9 +48,12 @@ char* _hyphenated(Bytes const& bytes, char* to) {
     return to;
 }
 
-Identifier _identifier(Bytes const& bytes) {
+/// An identifier of random bytes.
+template <class Random>
+Identifier _identifier(Random& random) {
     Identifier identifier;
-    identifier.bytes = bytes;
+    Bytes& bytes = identifier.bytes;
+    for (unsigned char& byte : bytes) byte = static_cast<unsigned char>(random() & 0xFF);
     char text[36];
     identifier.text.assign(text, _hyphenated(bytes, text));
     identifier.ours = Koru::Uuid(std::vector<unsigned char>(bytes.begin(), bytes.end()));
@@ -60,160 +63,150 @@ Identifier _identifier(Bytes const& bytes) {
     return identifier;
 }
 
-/// Identifiers that cannot be foreseen, handed out in a circle.
-class Identifiers {
-public:
-    Identifiers() {
-        std::mt19937 random(1);
-        for (std::size_t i = 0; i < COUNT; ++i) {
-            Bytes bytes;
-            for (unsigned char& byte : bytes) byte = static_cast<unsigned char>(random() & 0xFF);
-            identifiers_.push_back(_identifier(bytes));
-        }
+using Identifiers = bench::Circle<Identifier>;
+
+std::vector<std::string> _texts(Identifiers const& identifiers) {
+    std::vector<std::string> texts;
+    for (Identifier const& identifier : identifiers) texts.push_back(identifier.text);
+    return texts;
+}
+
+#ifdef KORU_BENCH_HAS_LIBUUID
+struct Libuuid {
+    static constexpr char const* name = "libuuid";
+    static Bytes parse(Identifier const& identifier) {
+        Bytes bytes;
+        ::uuid_parse(identifier.text.c_str(), bytes.data());
+        return bytes;
     }
-
-    Identifier const& next() { return identifiers_[at_++ % COUNT]; }
-    Identifier const* begin() const { return identifiers_.data(); }
-    Identifier const* end() const { return identifiers_.data() + COUNT; }
-    std::vector<std::string> texts() const {
-        std::vector<std::string> texts;
-        for (Identifier const& identifier : identifiers_) texts.push_back(identifier.text);
-        return texts;
+    static std::string format(Identifier const& identifier) {
+        char text[37];
+        ::uuid_unparse_lower(identifier.bytes.data(), text);
+        return std::string(text, 36);
     }
-
-private:
-    static constexpr std::size_t COUNT = 64;
-
-    std::vector<Identifier> identifiers_;
-    std::size_t at_ = 0;
+    static bool areEqual(Identifier const& one, Identifier const& other) {
+        return ::uuid_compare(one.bytes.data(), other.bytes.data()) == 0;
+    }
 };
+#else
+struct Libuuid : bench::Missing {
+    static constexpr char const* name = "libuuid";
+};
+#endif
 
-void _parse(bench::Report& report, Identifiers identifiers) {
+#ifdef KORU_BENCH_HAS_BOOST
+struct Boost {
+    static constexpr char const* name = "Boost";
+    static boost::uuids::uuid parse(Identifier const& identifier) {
+        return boost::uuids::string_generator()(identifier.text);
+    }
+    static std::string format(Identifier const& identifier) {
+        return boost::uuids::to_string(identifier.boost);
+    }
+    static bool write(std::ostream& out, Identifier const& identifier) {
+        return bool(out << identifier.boost);
+    }
+    static bool areEqual(Identifier const& one, Identifier const& other) {
+        return one.boost == other.boost;
+    }
+};
+#else
+struct Boost : bench::Missing {
+    static constexpr char const* name = "Boost";
+};
+#endif
+
+void _parse(bench::Report& report, Identifiers const& identifiers) {
     for (Identifier const& identifier : identifiers) {
         bench::require(Koru::Uuid(identifier.text) == identifier.ours,
                        "the identifier was read as another one");
     }
-    std::vector<Peer> peers = {
-        bench::peer("Qt, of a QByteArray", bench::qtParse(identifiers.texts())),
-        bench::limit("Qt, of a view", bench::qtParseLatin1(identifiers.texts()))};
-#ifdef KORU_BENCH_HAS_LIBUUID
-    peers.push_back(bench::peer("libuuid", Work::repeated([identifiers]() mutable {
-                                    Bytes bytes;
-                                    ::uuid_parse(identifiers.next().text.c_str(), bytes.data());
-                                    return bytes;
-                                })));
-#else
-    peers.push_back(bench::missing("libuuid"));
-#endif
-#ifdef KORU_BENCH_HAS_BOOST
-    peers.push_back(bench::peer("Boost", Work::repeated([identifiers]() mutable {
-                                    return boost::uuids::string_generator()(
-                                        identifiers.next().text);
-                                })));
-#else
-    peers.push_back(bench::missing("Boost"));
-#endif
-    report.compare("parse", Work::repeated([identifiers]() mutable {
-                       return Koru::Uuid(identifiers.next().text);
-                   }),
-                   peers, 0.4);
+    std::vector<std::string> const texts = _texts(identifiers);
+    Work const ours = identifiers.each([](Identifier const& i) { return Koru::Uuid(i.text); });
+    auto const parse = [&](auto library) {
+        return identifiers.each([library](Identifier const& i) { return library.parse(i); });
+    };
+    report.compare("parse", ours,
+                   {bench::peer("Qt, of a QByteArray", bench::qtParse(texts)),
+                    bench::limit("Qt, of a view", bench::qtParseLatin1(texts)),
+                    bench::peerOf<Libuuid>(parse), bench::peerOf<Boost>(parse)},
+                   0.4);
 }
 
-void _format(bench::Report& report, Identifiers identifiers) {
+void _format(bench::Report& report, Identifiers const& identifiers) {
+    Work const ours = identifiers.each([](Identifier const& i) {
+        std::string text = i.ours;
+        return text;
+    });
     for (Identifier const& identifier : identifiers) {
         std::string const text = identifier.ours;
         bench::require(text == identifier.text, "the identifier was written as another one");
     }
-    std::vector<Peer> peers = {bench::peer("Qt", bench::qtFormat(identifiers.texts()))};
-#ifdef KORU_BENCH_HAS_LIBUUID
-    peers.push_back(bench::peer("libuuid", Work::repeated([identifiers]() mutable {
-                                    char text[37];
-                                    ::uuid_unparse_lower(identifiers.next().bytes.data(), text);
-                                    return std::string(text, 36);
-                                })));
-#else
-    peers.push_back(bench::missing("libuuid"));
-#endif
-#ifdef KORU_BENCH_HAS_BOOST
-    peers.push_back(bench::peer("Boost", Work::repeated([identifiers]() mutable {
-                                    return boost::uuids::to_string(identifiers.next().boost);
-                                })));
-#else
-    peers.push_back(bench::missing("Boost"));
-#endif
-    peers.push_back(bench::limit("copy of the text", Work::repeated([identifiers]() mutable {
-                                     return std::string(identifiers.next().text);
-                                 })));
-    report.compare("format", Work::repeated([identifiers]() mutable {
-                       std::string text = identifiers.next().ours;
-                       return text;
-                   }),
-                   peers, 0.8);
+    Work const copy = identifiers.each([](Identifier const& i) { return std::string(i.text); });
+    auto const format = [&](auto library) {
+        return identifiers.each([library](Identifier const& i) { return library.format(i); });
+    };
+    report.compare("format", ours,
+                   {bench::peer("Qt", bench::qtFormat(_texts(identifiers))),
+                    bench::peerOf<Libuuid>(format), bench::peerOf<Boost>(format),
+                    bench::limit("copy of the text", copy)},
+                   0.8);
 }
 
-void _stream(bench::Report& report, Identifiers identifiers) {
+void _stream(bench::Report& report, Identifiers const& identifiers) {
     bench::FixedBuffer<char> buffer;
     std::ostream out(&buffer);
-    std::vector<Peer> peers;
-#ifdef KORU_BENCH_HAS_BOOST
-    peers.push_back(bench::peer("Boost", Work::repeated([&] {
-                                    buffer.rewind();
-                                    out << identifiers.next().boost;
-                                    return 0;
-                                })));
-#else
-    peers.push_back(bench::missing("Boost"));
-#endif
-    peers.push_back(bench::limit("sputn of the text", Work::repeated([&] {
-                                     std::string const& text = identifiers.next().text;
-                                     buffer.rewind();
-                                     return out.rdbuf()->sputn(text.data(), 36);
-                                 })));
-    report.compare("stream", Work::repeated([&] {
-                       buffer.rewind();
-                       out << identifiers.next().ours;
-                       return 0;
-                   }),
-                   peers, 0.06);
+    Work const ours = identifiers.each([&](Identifier const& i) {
+        buffer.rewind();
+        out << i.ours;
+        return 0;
+    });
+    Work const sputn = identifiers.each([&](Identifier const& i) {
+        buffer.rewind();
+        return out.rdbuf()->sputn(i.text.data(), 36);
+    });
+    auto const write = [&](auto library) {
+        return identifiers.each([&, library](Identifier const& i) {
+            buffer.rewind();
+            return library.write(out, i);
+        });
+    };
+    report.compare("stream", ours,
+                   {bench::peerOf<Boost>(write), bench::limit("sputn of the text", sputn)}, 0.06);
 }
 
 /// Boost's comparison is inlined into the application, which no library call can match: a limit.
 void _compare(bench::Report& report, Identifiers const& identifiers) {
     std::vector<Identifier> const one(identifiers.begin(), identifiers.end());
     std::vector<Identifier> const other = one;
-    std::vector<Peer> peers;
-#ifdef KORU_BENCH_HAS_LIBUUID
-    peers.push_back(bench::peer("libuuid", Work::repeated([&one, &other, at = 0U]() mutable {
-                                    std::size_t const i = at++ % one.size();
-                                    return ::uuid_compare(one[i].bytes.data(),
-                                                          other[i].bytes.data()) == 0;
-                                })));
-#else
-    peers.push_back(bench::missing("libuuid"));
-#endif
-    peers.push_back(bench::limit("memcmp", Work::repeated([&one, &other, at = 0U]() mutable {
-                                     std::size_t const i = at++ % one.size();
-                                     return std::memcmp(one[i].bytes.data(), other[i].bytes.data(),
-                                                        16);
-                                 })));
-#ifdef KORU_BENCH_HAS_BOOST
-    peers.push_back(
-        bench::limit("Boost, inlined", Work::repeated([&one, &other, at = 0U]() mutable {
-                         std::size_t const i = at++ % one.size();
-                         return one[i].boost == other[i].boost;
-                     })));
-#endif
-    report.compare("compare, equal", Work::repeated([&one, &other, at = 0U]() mutable {
-                       std::size_t const i = at++ % one.size();
-                       return one[i].ours == other[i].ours;
+    auto const compare = [&](auto areEqual) {
+        return Work::repeated([&, areEqual, at = 0U]() mutable {
+            std::size_t const i = at++ % one.size();
+            return areEqual(one[i], other[i]);
+        });
+    };
+    auto const byLibrary = [&](auto library) {
+        return compare(
+            [library](Identifier const& a, Identifier const& b) { return library.areEqual(a, b); });
+    };
+    Peer boost = bench::peerOf<Boost>(byLibrary);
+    boost.name = "Boost, inlined";
+    boost.isLimit = true;
+    report.compare("compare, equal", compare([](Identifier const& a, Identifier const& b) {
+                       return a.ours == b.ours;
                    }),
-                   peers, 0.6);
+                   {bench::peerOf<Libuuid>(byLibrary),
+                    bench::limit("memcmp", compare([](Identifier const& a, Identifier const& b) {
+                                     return std::memcmp(a.bytes.data(), b.bytes.data(), 16);
+                                 })),
+                    boost},
+                   0.6);
 }
 
 } // namespace
 
 int main(int argc, char** argv) {
-    Identifiers const identifiers;
+    Identifiers const identifiers([](auto& random) { return _identifier(random); });
     bench::Report report("identifiers", bench::Options(argc, argv));
     _parse(report, identifiers);
     _format(report, identifiers);
