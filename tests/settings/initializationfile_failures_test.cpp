@@ -225,10 +225,8 @@ TEST_CASE("reads and writes that transfer little at a time make no difference") 
     for (std::size_t const limit : {1UL, 7UL, 1000UL}) {
         CAPTURE(limit);
         transferLimit = limit;
-        std::string const bytes = written(place, settings);
-        InitializationFile file(place.path());
-        file.open(READ);
-        Settings const read = drain(file);
+        std::string const bytes = written(settings);
+        Settings const read = test::loaded(place, bytes);
         transferLimit = 0;
         CHECK(bytes == test::settingsText(settings));
         checkSame(read, settings);

@@ -6,6 +6,7 @@
 
 #include <cstddef>
 #include <filesystem>
+#include <initializer_list>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -39,6 +40,21 @@ private:
     std::string path_ = directory_ / "settings.ini";
 };
 
+/// The place of a file object, made before it and removed after it.
+struct HasPlace {
+    SettingsPlace const place;
+};
+
+/// A settings file of its own. With bytes it is there and open, without it is not.
+class SettingsFile : public HasPlace, public Koru::InitializationFile {
+public:
+    SettingsFile() : InitializationFile(place.path()) {}
+    explicit SettingsFile(std::string const& bytes, unsigned long mode = READ) : SettingsFile() {
+        place.write(bytes);
+        open(mode);
+    }
+};
+
 /// Takes the table apart from its front and returns it, each entry exactly as it is held: the first
 /// section enumerated and its first key are those of the first entry.
 inline Settings drain(Koru::InitializationFile& file) {
@@ -63,34 +79,44 @@ inline Settings loaded(SettingsPlace const& place, std::string const& bytes) {
 }
 
 /// The bytes that a table, filled in this order, is written as.
-inline std::string written(SettingsPlace const& place, Settings const& settings) {
-    Koru::InitializationFile file(place.path());
-    file.open(WRITE);
+inline std::string written(Settings const& settings) {
+    SettingsFile file("", WRITE);
     for (Setting const& s : settings) file.setValue(s.section, s.key, s.value);
     file.close();
-    return place.bytes();
+    return file.place.bytes();
+}
+
+/// What a file of these bytes holds when it was opened and closed.
+inline std::string rewritten(std::string const& bytes) {
+    SettingsFile file(bytes, READ_WRITE);
+    file.close();
+    return file.place.bytes();
 }
 
 /// Both are the same, shown when not.
-inline void checkSame(Settings const& actual, Settings const& expected) {
+template <class T>
+void checkSame(T const& actual, T const& expected) {
     bool const same = actual == expected;
-    INFO("actual:\n", shown(actual), "expected:\n", shown(expected));
+    INFO("actual:\n", shown(actual), "\nexpected:\n", shown(expected));
     CHECK(same);
+}
+
+inline void checkSame(std::wstring const& actual, wchar_t const* expected) {
+    checkSame(actual, std::wstring(expected));
 }
 
 inline void checkSame(std::vector<std::wstring> const& actual,
-                      std::vector<std::wstring> const& expected) {
-    bool const same = actual == expected;
-    INFO("actual: ", shown(actual), "expected: ", shown(expected));
-    CHECK(same);
+                      std::initializer_list<wchar_t const*> expected) {
+    checkSame(actual, std::vector<std::wstring>(expected.begin(), expected.end()));
 }
 
-inline void checkSame(std::wstring const& actual, std::wstring const& expected) {
-    CHECK(shown(actual) == shown(expected));
+/// The entries in order, in a form like "section/key=value | section/key=value".
+inline void checkEntries(Settings const& actual, char const* expected) {
+    CHECK(shown(actual) == expected);
 }
 
-inline void checkSame(std::string const& actual, std::string const& expected) {
-    CHECK(shown(actual) == shown(expected));
+inline void checkEntries(Koru::InitializationFile& file, char const* expected) {
+    checkEntries(drain(file), expected);
 }
 
 /// Every section, key and value that the library gives is the model's.
@@ -104,6 +130,20 @@ inline void checkTable(Koru::InitializationFile& file, SettingsTableModel const&
         checkSame(file.getValue(s.section, s.key), model.getValue(s.section, s.key));
     }
 }
+
+/// A table of the library's and one of the model's, given the same changes.
+template <class Model = SettingsTableModel>
+struct Twins {
+    SettingsFile file;
+    Model model;
+
+    template <class Change>
+    void change(Change change) {
+        change(file);
+        change(model);
+    }
+    void check() { checkTable(file, model); }
+};
 
 } // namespace test
 

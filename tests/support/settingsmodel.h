@@ -29,10 +29,12 @@ inline bool operator==(Setting const& a, Setting const& b) {
 
 using Settings = std::vector<Setting>;
 
+/// Like "section/key=value | section/key=value".
 inline std::string shown(Settings const& settings) {
     std::string result;
     for (Setting const& s : settings) {
-        result += '[' + shown(s.section) + "] " + shown(s.key) + '=' + shown(s.value) + '\n';
+        if (!result.empty()) result += " | ";
+        result += shown(s.section) + '/' + shown(s.key) + '=' + shown(s.value);
     }
     return result;
 }
@@ -93,6 +95,22 @@ inline void sortSettings(Settings& settings) {
         if (bySection != 0) return bySection < 0;
         return Koru::compare(a.key, b.key) < 0;
     });
+}
+
+/// The table that a file of these bytes is read into.
+inline Settings sortedSettings(std::string const& bytes) {
+    Settings settings = parseSettings(bytes);
+    sortSettings(settings);
+    return settings;
+}
+
+/// A section is written once, as its first entry spells it.
+inline Settings spelledOnce(Settings sorted) {
+    for (std::size_t i = 1; i < sorted.size(); ++i) {
+        std::wstring const& before = sorted[i - 1].section;
+        if (sameName(sorted[i].section, before)) sorted[i].section = before;
+    }
+    return sorted;
 }
 
 /// The bytes that a table in this order is written as.
@@ -196,8 +214,7 @@ public:
         if (!open_ && !openStream(mode)) return false;
         mode_ = mode;
         settings.clear();
-        if (reads(mode) && readable_) settings = parseSettings(bytes);
-        sortSettings(settings);
+        if (reads(mode) && readable_) settings = sortedSettings(bytes);
         return true;
     }
 
