@@ -2,16 +2,13 @@
 // random files, random sequences of operations, large tables and the names that locales fold.
 #include <doctest/doctest.h>
 
-#include <locale.h>
 #include <wchar.h>
 
 #include <algorithm>
 #include <clocale>
 #include <cstddef>
-#include <cstdlib>
 #include <cwctype>
 #include <filesystem>
-#include <random>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -19,56 +16,44 @@
 #include <koru/initializationfile.h>
 #include <koru/string.h>
 
+#include "support/choices.h"
+#include "support/locales.h"
 #include "support/settingsfixture.h"
 #include "support/settingsmodel.h"
-#include "support/subprocess.h"
-#include "support/tempdir.h"
 #include "support/throws.h"
 
 using Koru::InitializationFile;
 using test::checkSame;
 using test::checkTable;
+using test::Dice;
 using test::drain;
+using test::forEachText;
+using test::inEachLocale;
 using test::loaded;
 using test::messageOf;
 using test::READ;
 using test::READ_WRITE;
 using test::Setting;
 using test::Settings;
+using test::SettingsFile;
 using test::SettingsFileModel;
 using test::SettingsPlace;
-using test::SettingsTableModel;
+using test::sortedSettings;
+using test::Twins;
 using test::WRITE;
 using namespace std::string_literals;
 
 namespace {
 
-/// Calls `visit` with every string of up to `longest` characters of the alphabet.
-template <class Visit>
-void forEachLine(std::string const& alphabet, std::size_t longest, Visit visit) {
-    visit(std::string());
-    std::vector<std::string> lines{""};
-    for (std::size_t length = 1; length <= longest; ++length) {
-        std::vector<std::string> longer;
-        for (std::string const& line : lines) {
-            for (char const c : alphabet) {
-                longer.push_back(line + c);
-                visit(longer.back());
-            }
-        }
-        lines.swap(longer);
-    }
-}
-
 /// Opens a file of these bytes, compares the table with the model, writes it back and compares the
 /// bytes, then reads and compares again.
 void checkFile(SettingsPlace const& place, std::string const& bytes) {
     place.write(bytes);
+    InitializationFile file(place.path());
+    file.open(READ_WRITE);
     SettingsFileModel model;
     model.exists = true;
     model.bytes = bytes;
-    InitializationFile file(place.path());
-    file.open(READ_WRITE);
     CHECK(model.open(READ_WRITE));
     checkTable(file, model);
     file.synchronize();
@@ -80,58 +65,29 @@ void checkFile(SettingsPlace const& place, std::string const& bytes) {
     checkSame(place.bytes(), model.bytes);
 }
 
-/// Random choices that are the same on every run and every platform.
-class Dice {
-public:
-    explicit Dice(unsigned seed) : engine_(seed) {}
-    std::size_t below(std::size_t limit) { return engine_() % limit; }
-    bool oneIn(std::size_t chances) { return below(chances) == 0; }
-    template <class Sequence>
-    typename Sequence::value_type const& from(Sequence const& choices) {
-        return choices[below(choices.size())];
-    }
-    template <class String>
-    String text(String const& alphabet, std::size_t longest) {
-        String result;
-        for (std::size_t length = below(longest + 1); length > 0; --length) {
-            result += from(alphabet);
-        }
-        return result;
-    }
-
-private:
-    std::mt19937 engine_;
-};
-
-std::string const syntax = "[]=#;aAb\t \r\n\0\x80\xC3\xA9\xE2\xFF\xC0"s;
-
 } // namespace
 
 TEST_CASE("every line of up to five characters of the syntax is read as the model reads it") {
     SettingsPlace const place;
     std::string bytes;
     std::size_t lines = 0;
-    std::size_t total = 0;
-    forEachLine("[]=#;a\t ", 5, [&](std::string const& line) {
-        // A header of its own before each, and an entry behind it that shows the section then.
-        bytes += "[h" + std::to_string(total++) + "]\n" + line + "\nk=v\n";
-        if (++lines < 128) return;
+    forEachText("[]=#;a\t ", 5, [&](std::string const& line) {
+        // A header of its own before each, and an entry after it that shows the section then.
+        bytes += "[h" + std::to_string(lines) + "]\n" + line + "\nk=v\n";
+        if (++lines % 128 != 0) return;
         checkFile(place, bytes);
         bytes.clear();
-        lines = 0;
     });
     checkFile(place, bytes);
-    CHECK(total == 37449U);
+    CHECK(lines == 37449U);
 }
 
 TEST_CASE("every line of up to four characters of the syntax is read at the end of a file") {
     SettingsPlace const place;
-    forEachLine("[]=#;a\t ", 4, [&](std::string const& line) {
+    forEachText("[]=#;a\t ", 4, [&place](std::string const& line) {
         CAPTURE(line);
         std::string const bytes = "[h]\nb=1\n" + line;
-        Settings expected = test::parseSettings(bytes);
-        test::sortSettings(expected);
-        checkSame(loaded(place, bytes), expected);
+        checkSame(loaded(place, bytes), sortedSettings(bytes));
     });
 }
 
@@ -139,9 +95,10 @@ TEST_CASE("every line of up to three bytes that matter to UTF-8 is read as the m
     SettingsPlace const place;
     std::string bytes;
     std::size_t lines = 0;
-    forEachLine("[=a\0\x80\xBF\xC0\xC3\xE2\xFF"s, 3, [&](std::string const& line) {
-        bytes += "[h" + std::to_string(lines) + "]\n" + line + "\nk=v\n[" + line + "]\nk" +
-                 std::to_string(lines) + "=v\nk" + line + "=v" + line + "\n";
+    forEachText("[=a\0\x80\xBF\xC0\xC3\xE2\xFF"s, 3, [&](std::string const& line) {
+        std::string const number = std::to_string(lines);
+        bytes += "[h" + number + "]\n" + line + "\nk=v\n[" + line + "]\nk" + number + "=v\nk" +
+                 line + "=v" + line + "\n";
         if (++lines % 64 != 0) return;
         checkFile(place, bytes);
         bytes.clear();
@@ -151,14 +108,13 @@ TEST_CASE("every line of up to three bytes that matter to UTF-8 is read as the m
 
 TEST_CASE("random files are read and written as the model does") {
     SettingsPlace const place;
+    std::string const syntax = "[]=#;aAb\t \r\n\0\x80\xC3\xA9\xE2\xFF\xC0"s;
     for (unsigned seed = 1; seed <= 1500; ++seed) {
         CAPTURE(seed);
         Dice dice(seed);
         std::string bytes = dice.oneIn(4) ? "" : "[s]\n";
         bytes += dice.text(syntax, 300);
-        Settings expected = test::parseSettings(bytes);
-        test::sortSettings(expected);
-        checkSame(loaded(place, bytes), expected);
+        checkSame(loaded(place, bytes), sortedSettings(bytes));
         checkFile(place, bytes);
     }
 }
@@ -173,34 +129,31 @@ TEST_CASE("random files of likely lines are read and written as the model does")
         CAPTURE(seed);
         Dice dice(seed);
         std::string bytes = "[s]\n";
-        for (std::size_t count = dice.below(400); count > 0; --count) bytes += dice.from(pieces);
+        for (std::size_t left = dice.below(400); left > 0; --left) bytes += dice.from(pieces);
         checkFile(place, bytes);
     }
 }
 
 TEST_CASE("removeSection does the same as the model on every arrangement of eight entries") {
-    InitializationFile file;
     for (unsigned pattern = 0; pattern < 256; ++pattern) {
         CAPTURE(pattern);
-        SettingsTableModel model;
-        for (unsigned i = 0; i < 8; ++i) {
-            std::wstring const section = (pattern >> i & 1U) != 0 ? L"s" : L"t";
-            std::wstring const key = std::to_wstring(i);
-            file.setValue(section, key, L"v");
-            model.setValue(section, key, L"v");
-        }
-        file.removeSection(L"S");
-        model.removeSection(L"S");
-        checkSame(drain(file), model.settings);
+        Twins<> twins;
+        twins.change([pattern](auto& table) {
+            for (unsigned i = 0; i < 8; ++i) {
+                table.setValue((pattern >> i & 1U) != 0 ? L"s" : L"t", std::to_wstring(i), L"v");
+            }
+            table.removeSection(L"S");
+        });
+        checkSame(drain(twins.file), twins.model.settings);
     }
 }
 
 namespace {
 
-/// A library's file and the model, given the same commands.
-class Pair {
+/// A library's file and the model, given the same random commands.
+class RandomTwins : public Twins<SettingsFileModel> {
 public:
-    explicit Pair(unsigned seed) : dice_(seed), file_(place_.path()) {}
+    explicit RandomTwins(unsigned seed) : dice_(seed) {}
 
     /// A file of likely entries to begin with.
     void begin(std::size_t entries) {
@@ -209,10 +162,10 @@ public:
             if (dice_.oneIn(5)) bytes += "[" + Koru::make_string(section()) + "]\n";
             bytes += Koru::make_string(key()) + "=" + Koru::make_string(value()) + "\n";
         }
-        place_.write(bytes);
-        model_.exists = true;
-        model_.bytes = bytes;
-        checkSame(openResult(READ_WRITE), L"<nothing>");
+        file.place.write(bytes);
+        model.exists = true;
+        model.bytes = bytes;
+        open(READ_WRITE);
     }
 
     void step() {
@@ -220,42 +173,30 @@ public:
         key_ = key();
         value_ = value();
         std::size_t const choice = dice_.below(24);
-        if (choice == 0) {
-            file_.createSection(section_);
-            model_.createSection(section_);
-        } else if (choice == 1) {
-            file_.removeSection(section_);
-            model_.removeSection(section_);
-        } else if (choice == 2) {
-            lifeCycle();
-        } else if (choice < 6) {
-            file_.createKey(section_, key_);
-            model_.createKey(section_, key_);
-        } else if (choice < 9) {
-            file_.removeKey(section_, key_);
-            model_.removeKey(section_, key_);
-        } else if (choice < 12) {
-            checkSame(file_.getValue(section_, key_), model_.getValue(section_, key_));
-            checkSame(file_.enumerateKeys(section_), model_.enumerateKeys(section_));
-        } else {
-            file_.setValue(section_, key_, value_);
-            model_.setValue(section_, key_, value_);
-        }
+        if (choice == 2) return lifeCycle();
+        if (choice >= 9 && choice < 12) return glance();
+        change([this, choice](auto& table) {
+            if (choice == 0) return table.createSection(section_);
+            if (choice == 1) return table.removeSection(section_);
+            if (choice < 6) return table.createKey(section_, key_);
+            if (choice < 9) return table.removeKey(section_, key_);
+            table.setValue(section_, key_, value_);
+        });
     }
 
-    void check() {
-        checkTable(file_, model_);
-        CHECK(file_.getMode() == model_.getMode());
-        CHECK(file_.is_open() == model_.isOpen());
-        CHECK(place_.exists() == model_.exists);
-        if (model_.exists) checkSame(place_.bytes(), model_.bytes);
+    void checkAll() {
+        check();
+        CHECK(file.getMode() == model.getMode());
+        CHECK(file.is_open() == model.isOpen());
+        CHECK(file.place.exists() == model.exists);
+        if (model.exists) checkSame(file.place.bytes(), model.bytes);
     }
 
     /// A cheaper look: the names in one section and one value.
     void glance() {
-        checkSame(file_.enumerateKeys(section_), model_.enumerateKeys(section_));
-        checkSame(file_.getValue(section_, key_), model_.getValue(section_, key_));
-        checkSame(file_.enumerateSections(), model_.enumerateSections());
+        checkSame(file.enumerateKeys(section_), model.enumerateKeys(section_));
+        checkSame(file.getValue(section_, key_), model.getValue(section_, key_));
+        checkSame(file.enumerateSections(), model.enumerateSections());
     }
 
     /// Fewer names make more duplicates and more matches.
@@ -263,10 +204,7 @@ public:
     std::size_t keyNames = 6;
 
 private:
-    SettingsPlace place_;
     Dice dice_;
-    InitializationFile file_;
-    SettingsFileModel model_;
     std::wstring section_;
     std::wstring key_;
     std::wstring value_;
@@ -297,36 +235,27 @@ private:
         return dice_.text(alphabet, 12);
     }
 
-    std::wstring openResult(unsigned long mode) {
-        std::string const message = messageOf<std::runtime_error>([&] { file_.open(mode); });
-        CHECK((message == "<nothing>") == model_.open(mode));
-        return std::wstring(message.begin(), message.end());
+    /// Both succeed, or both fail.
+    template <class Both>
+    void attempt(Both both) {
+        std::string const message = messageOf<std::runtime_error>([&] { both(file); });
+        CHECK(message == (both(model) ? "<nothing>" : "failed to open file."));
+    }
+
+    void open(unsigned long mode) {
+        attempt([mode](auto& table) { return table.open(mode); });
     }
 
     void lifeCycle() {
         static std::vector<unsigned long> const modes{READ,       READ_WRITE, READ_WRITE,
                                                       READ_WRITE, READ_WRITE, WRITE};
-        switch (dice_.below(8)) {
-        case 0:
-            file_.setMode(value_.size() % 4);
-            model_.setMode(value_.size() % 4);
-            break;
-        case 1:
-            openResult(dice_.from(modes)); // perhaps on the open file
-            break;
-        case 2:
-        case 3:
-        case 4: {
-            std::string const message = messageOf<std::runtime_error>([&] { file_.synchronize(); });
-            CHECK((message == "<nothing>") == model_.synchronize());
-            break;
-        }
-        default:
-            file_.close();
-            model_.close();
-            checkSame(place_.bytes(), model_.bytes);
-            openResult(dice_.from(modes));
-        }
+        std::size_t const choice = dice_.below(8);
+        if (choice == 0) return change([this](auto& table) { table.setMode(value_.size() % 4); });
+        if (choice == 1) return open(dice_.from(modes)); // perhaps on the open file
+        if (choice < 5) return attempt([](auto& table) { return table.synchronize(); });
+        change([](auto& table) { table.close(); });
+        checkSame(file.place.bytes(), model.bytes);
+        open(dice_.from(modes));
     }
 };
 
@@ -335,12 +264,12 @@ private:
 TEST_CASE("random operations on small tables agree with the model after every step") {
     for (unsigned seed = 1; seed <= 30; ++seed) {
         CAPTURE(seed);
-        Pair pair(seed);
-        pair.begin(seed % 30);
+        RandomTwins twins(seed);
+        twins.begin(seed % 30);
         for (int step = 0; step < 80; ++step) {
             CAPTURE(step);
-            pair.step();
-            pair.check();
+            twins.step();
+            twins.checkAll();
         }
     }
 }
@@ -348,49 +277,48 @@ TEST_CASE("random operations on small tables agree with the model after every st
 TEST_CASE("random operations on tables of hundreds of entries agree with the model") {
     for (unsigned seed = 1; seed <= 8; ++seed) {
         CAPTURE(seed);
-        Pair pair(seed);
-        pair.sectionNames = 3 + seed * 2;
-        pair.keyNames = 40;
-        pair.begin(400);
+        RandomTwins twins(seed);
+        twins.sectionNames = 3 + seed * 2;
+        twins.keyNames = 40;
+        twins.begin(400);
         for (int step = 0; step < 600; ++step) {
             CAPTURE(step);
-            pair.step();
-            pair.glance();
-            if (step % 100 == 0) pair.check();
+            twins.step();
+            twins.glance();
+            if (step % 100 == 0) twins.checkAll();
         }
-        pair.check();
+        twins.checkAll();
     }
 }
 
 TEST_CASE("tables of every size up to two hundred find, miss and remove as the model does") {
-    InitializationFile file;
     for (std::size_t size = 0; size <= 200; ++size) {
         CAPTURE(size);
-        SettingsTableModel model;
+        Twins<> twins;
+        twins.change([size](auto& table) {
+            for (std::size_t i = 0; i < size; ++i) {
+                std::wstring const key = L"Key" + std::to_wstring(i);
+                table.setValue(L"Section" + std::to_wstring(i % 3), key, key);
+            }
+        });
         for (std::size_t i = 0; i < size; ++i) {
-            std::wstring const section = L"Section" + std::to_wstring(i % 3);
-            std::wstring const key = L"Key" + std::to_wstring(i);
-            file.setValue(section, key, key);
-            model.setValue(section, key, key);
+            std::wstring const number = std::to_wstring(i);
+            checkSame(twins.file.getValue(L"SECTION" + std::to_wstring(i % 3), L"KEY" + number),
+                      L"Key" + number);
         }
-        for (std::size_t i = 0; i < size; ++i) {
-            checkSame(
-                file.getValue(L"SECTION" + std::to_wstring(i % 3), L"KEY" + std::to_wstring(i)),
-                L"Key" + std::to_wstring(i));
-        }
-        checkSame(file.getValue(L"Section0", L"Key" + std::to_wstring(size)), L"");
-        checkSame(file.getValue(L"Section1", L"Key0"), L"");
-        for (std::size_t const i : {size / 2, std::size_t(0), size - 1}) {
-            file.removeKey(L"section" + std::to_wstring(i % 3), L"key" + std::to_wstring(i));
-            model.removeKey(L"section" + std::to_wstring(i % 3), L"key" + std::to_wstring(i));
-        }
-        checkTable(file, model);
-        checkSame(drain(file), model.settings);
+        checkSame(twins.file.getValue(L"Section0", L"Key" + std::to_wstring(size)), L"");
+        checkSame(twins.file.getValue(L"Section1", L"Key0"), L"");
+        twins.change([size](auto& table) {
+            for (std::size_t const i : {size / 2, std::size_t(0), size - 1}) {
+                table.removeKey(L"section" + std::to_wstring(i % 3), L"key" + std::to_wstring(i));
+            }
+        });
+        twins.check();
+        checkSame(drain(twins.file), twins.model.settings);
     }
 }
 
 TEST_CASE("in a table of six thousand entries every key is found and every other is missed") {
-    SettingsPlace const place;
     std::string bytes;
     for (int section = 0; section < 60; ++section) {
         bytes += "[Section " + std::to_string(section) + "]\n";
@@ -399,19 +327,12 @@ TEST_CASE("in a table of six thousand entries every key is found and every other
             bytes += "Key " + std::to_string(key * 7919 % 100) + "=value " + number + "\n";
         }
     }
-    place.write(bytes);
-    Settings expected = test::parseSettings(bytes);
+    Settings const expected = sortedSettings(bytes);
     CHECK(expected.size() == 6000U);
-    test::sortSettings(expected);
-    InitializationFile file(place.path());
-    file.open(READ_WRITE);
+    SettingsFile file(bytes, READ_WRITE);
     for (Setting const& s : expected) {
         // Keys and sections differ in their numbers, so the entry itself is the first match.
-        std::wstring section = s.section;
-        std::wstring key = s.key;
-        section[0] = L's';
-        key[2] = L'Y';
-        CHECK(file.getValue(section, key) == s.value);
+        CHECK(file.getValue(L's' + s.section.substr(1), L"KEY" + s.key.substr(3)) == s.value);
     }
     for (int section = 0; section < 60; ++section) {
         std::wstring const name = L"section " + std::to_wstring(section);
@@ -423,36 +344,31 @@ TEST_CASE("in a table of six thousand entries every key is found and every other
     }
     CHECK(file.enumerateSections().size() == 60U);
     file.close();
-    CHECK(place.bytes() == test::settingsText(expected));
+    CHECK(file.place.bytes() == test::settingsText(expected));
 }
 
 TEST_CASE("sections and keys that come and go by the thousand leave the table right") {
-    SettingsPlace const place;
     std::string bytes;
     for (int i = 0; i < 10; ++i) bytes += "[kept " + std::to_string(i) + "]\nk=v\n";
-    place.write(bytes);
-    InitializationFile file(place.path());
-    file.open(READ_WRITE);
-    SettingsTableModel model;
-    model.settings = test::parseSettings(bytes);
+    Twins<> twins;
+    twins.file.place.write(bytes);
+    twins.file.open(READ_WRITE);
+    twins.model.settings = test::parseSettings(bytes);
     for (int i = 0; i < 4000; ++i) {
         CAPTURE(i);
         std::wstring const section = L"section " + std::to_wstring(i % 300);
         std::wstring const key = L"key " + std::to_wstring(i % 7);
-        file.setValue(section, key, std::to_wstring(i));
-        model.setValue(section, key, std::to_wstring(i));
-        if (i % 10 == 0) {
-            file.setValue(L"KEPT " + std::to_wstring(i / 10 % 10), key, L"also kept");
-            model.setValue(L"KEPT " + std::to_wstring(i / 10 % 10), key, L"also kept");
-        }
-        file.removeKey(section, key);
-        model.removeKey(section, key);
-        if (i % 97 == 0) checkTable(file, model);
+        twins.change([&](auto& table) {
+            table.setValue(section, key, std::to_wstring(i));
+            if (i % 10 == 0) table.setValue(L"KEPT " + std::to_wstring(i / 10 % 10), key, L"too");
+            table.removeKey(section, key);
+        });
+        if (i % 97 == 0) twins.check();
     }
-    checkTable(file, model);
-    test::sortSettings(model.settings);
-    file.close();
-    CHECK(place.bytes() == test::settingsText(model.settings));
+    twins.check();
+    test::sortSettings(twins.model.settings);
+    twins.file.close();
+    CHECK(twins.file.place.bytes() == test::settingsText(twins.model.settings));
 }
 
 TEST_CASE("names of the same length, letters or ends are told apart") {
@@ -474,62 +390,68 @@ TEST_CASE("names of the same length, letters or ends are told apart") {
         names.push_back(std::wstring(length - 1, L'x') + L'\x7F');
         names.push_back(std::wstring(length - 1, L'x') + L"\0y"s);
     }
-    InitializationFile file;
-    SettingsTableModel model;
-    for (std::size_t i = 0; i < names.size(); ++i) {
-        std::wstring const& section = names[i * 31 % names.size()];
-        file.setValue(section, names[i], std::to_wstring(i));
-        model.setValue(section, names[i], std::to_wstring(i));
-    }
-    checkTable(file, model);
+    Twins<> twins;
+    twins.change([&names](auto& table) {
+        for (std::size_t i = 0; i < names.size(); ++i) {
+            table.setValue(names[i * 31 % names.size()], names[i], std::to_wstring(i));
+        }
+    });
+    twins.check();
+    auto const checkValue = [&twins](std::wstring const& section, std::wstring const& key) {
+        checkSame(twins.file.getValue(section, key), twins.model.getValue(section, key));
+    };
     for (std::size_t i = 0; i < names.size(); ++i) {
         for (std::size_t const j : {i, i + 1, i * 31, i * 7 + 3, i * 31 + 31}) {
-            std::wstring const& section = names[j % names.size()];
-            checkSame(file.getValue(section, names[i]), model.getValue(section, names[i]));
-            checkSame(file.getValue(names[i], section), model.getValue(names[i], section));
+            checkValue(names[j % names.size()], names[i]);
+            checkValue(names[i], names[j % names.size()]);
         }
     }
 }
 
 TEST_CASE("long keys and values of every length around the sizes of blocks are held") {
-    SettingsPlace const place;
-    InitializationFile file(place.path());
-    file.open(READ_WRITE);
-    SettingsTableModel model;
-    for (std::size_t length = 0; length <= 150; ++length) {
-        for (wchar_t const last : {L'z', L'\u00E9', L'\U0001F600'}) {
-            std::wstring const key = std::wstring(length, L'k') + last;
-            std::wstring const value = std::wstring(length, L'v') + last;
-            file.setValue(L"S" + key, key, value);
-            model.setValue(L"S" + key, key, value);
+    Twins<> twins;
+    twins.file.open(READ_WRITE);
+    twins.change([](auto& table) {
+        for (std::size_t length = 0; length <= 150; ++length) {
+            for (wchar_t const last : {L'z', L'\u00E9', L'\U0001F600'}) {
+                std::wstring const key = std::wstring(length, L'k') + last;
+                table.setValue(L"S" + key, key, std::wstring(length, L'v') + last);
+            }
         }
-    }
-    checkTable(file, model);
-    file.synchronize();
-    test::sortSettings(model.settings);
-    checkTable(file, model);
-    CHECK(place.bytes() == test::settingsText(model.settings));
+    });
+    twins.check();
+    twins.file.synchronize();
+    test::sortSettings(twins.model.settings);
+    twins.check();
+    CHECK(twins.file.place.bytes() == test::settingsText(twins.model.settings));
 }
 
-TEST_CASE("units that compare inconsistently neither crash the sorting nor lose an entry") {
-    // wcscasecmp subtracts 32-bit units, so of three names each may be less than the next.
+namespace {
+
+/// wcscasecmp subtracts 32-bit units, so of three of these each may be less than the next.
+std::wstring inconsistentUnits() {
     std::wstring units;
     for (unsigned long const unit : {0x80000000UL, 0xFFFFFFFFUL, 0xC0000000UL, 0x7FFFFFFFUL,
                                      0x40000000UL, 0x80000001UL, 0x61UL, 0xBFFFFFFFUL, 0x1UL}) {
         units.push_back(static_cast<wchar_t>(unit));
     }
-    test::TempDir const directory;
-    std::string const folder = directory / "folder";
-    auto const byNames = [](Setting const& a, Setting const& b) {
-        if (a.section != b.section) return a.section < b.section;
-        return a.key < b.key;
-    };
+    return units;
+}
+
+void sortByUnits(Settings& settings) {
+    std::sort(settings.begin(), settings.end(), [](Setting const& a, Setting const& b) {
+        return a.section != b.section ? a.section < b.section : a.key < b.key;
+    });
+}
+
+} // namespace
+
+TEST_CASE("units that compare inconsistently neither crash the sorting nor lose an entry") {
+    std::wstring const units = inconsistentUnits();
     for (std::size_t size = 0; size <= 300; ++size) {
         CAPTURE(size);
         Dice dice(static_cast<unsigned>(size) + 1);
-        std::filesystem::create_directory(folder);
-        InitializationFile file(folder + "/settings.ini");
-        file.open(WRITE);
+        SettingsFile file("", WRITE);
         Settings expected;
         while (expected.size() < size) {
             std::wstring const section = dice.text(units, 2);
@@ -540,27 +462,24 @@ TEST_CASE("units that compare inconsistently neither crash the sorting nor lose 
             expected.push_back({section, key, value});
         }
         // close sorts the table; without a place to write to it keeps it.
-        std::filesystem::remove_all(folder);
+        std::filesystem::remove_all(file.place.directory().path());
         CHECK(messageOf<std::runtime_error>([&] { file.close(); }) == "failed to open file.");
         Settings sorted = drain(file);
-        std::sort(sorted.begin(), sorted.end(), byNames);
-        std::sort(expected.begin(), expected.end(), byNames);
+        sortByUnits(sorted);
+        sortByUnits(expected);
         checkSame(sorted, expected);
     }
 }
 
 TEST_CASE("a table with units that compare inconsistently is written whole") {
-    SettingsPlace const place;
-    InitializationFile file(place.path());
-    file.open(WRITE);
+    SettingsFile file("", WRITE);
     Dice dice(7);
     for (int i = 0; i < 300; ++i) {
-        std::wstring key = std::to_wstring(i);
-        key.insert(0, 1, static_cast<wchar_t>(dice.below(4) << 30 | 0x41));
-        file.setValue(L"s", key, L"v");
+        wchar_t const unit = static_cast<wchar_t>(dice.below(4) << 30 | 0x41);
+        file.setValue(L"s", unit + std::to_wstring(i), L"v");
     }
     file.close();
-    std::string const bytes = place.bytes();
+    std::string const bytes = file.place.bytes();
     for (int i = 0; i < 300; ++i) {
         CAPTURE(i);
         CHECK(bytes.find(std::to_string(i) + "=v\n") != std::string::npos);
@@ -568,61 +487,7 @@ TEST_CASE("a table with units that compare inconsistently is written whole") {
     CHECK(std::count(bytes.begin(), bytes.end(), '\n') == 301);
 }
 
-// ------------------------------------------------------------------------------------- the locales
-
 namespace {
-
-/// A locale for the calls of this thread, for the time of a scope.
-class ThreadLocale {
-public:
-    explicit ThreadLocale(locale_t locale) : previous_(::uselocale(locale)) {}
-    ThreadLocale(ThreadLocale const&) = delete;
-    ThreadLocale& operator=(ThreadLocale const&) = delete;
-    ~ThreadLocale() { ::uselocale(previous_); }
-
-private:
-    locale_t previous_;
-};
-
-/// The locales that the tests go through; Turkish is compiled here where it can be.
-class Locales {
-public:
-    Locales() {
-        add("C", "C");
-        add("C.UTF-8", "C.UTF-8");
-        std::string const name = "tr_TR.UTF-8";
-        test::execute("/usr/bin/localedef",
-                      {"localedef", "-i", "tr_TR", "-f", "UTF-8", directory_ / name});
-        ::setenv("LOCPATH", directory_.path().c_str(), 1);
-        add("Turkish", name.c_str());
-        ::unsetenv("LOCPATH");
-    }
-    Locales(Locales const&) = delete;
-    Locales& operator=(Locales const&) = delete;
-    ~Locales() {
-        for (locale_t const locale : all_) ::freelocale(locale);
-    }
-    std::vector<locale_t> const& all() const { return all_; }
-
-private:
-    test::TempDir directory_;
-    std::vector<locale_t> all_;
-
-    void add(char const* label, char const* name) {
-        std::string const previous = std::setlocale(LC_ALL, nullptr);
-        if (std::setlocale(LC_ALL, name) != nullptr) {
-            all_.push_back(::duplocale(LC_GLOBAL_LOCALE));
-        } else {
-            MESSAGE("this locale is not to be had here and was not tested: ", label);
-        }
-        std::setlocale(LC_ALL, previous.c_str());
-    }
-};
-
-Locales const& locales() {
-    static Locales const theLocales; // compiling one takes a second
-    return theLocales;
-}
 
 /// Characters that some locale folds in a way of its own, with their partners.
 std::wstring const folded =
@@ -647,7 +512,6 @@ std::vector<std::wstring> foldedNames() {
 } // namespace
 
 TEST_CASE("lookups agree with a scan by compare under the locale of the moment") {
-    SettingsPlace const place;
     std::vector<std::wstring> const names = foldedNames();
     std::string bytes = "[keys]\n";
     for (std::wstring const& name : names) bytes += Koru::make_string(name) + "=" + "v\n";
@@ -655,91 +519,78 @@ TEST_CASE("lookups agree with a scan by compare under the locale of the moment")
         std::string const name = Koru::make_string(std::wstring(1, c));
         bytes += "[" + name + "]\nk=in " + name + "\n";
     }
-    place.write(bytes);
-    for (std::size_t opened = 0; opened < locales().all().size(); ++opened) {
+    inEachLocale([&] {
         // Sorted under one locale, asked under each of the others.
-        CAPTURE(opened);
-        InitializationFile file(place.path());
-        SettingsTableModel model;
-        {
-            ThreadLocale const locale(locales().all()[opened]);
-            file.open(READ);
-            model.settings = test::parseSettings(bytes);
-            test::sortSettings(model.settings);
-            checkTable(file, model);
-        }
-        for (std::size_t asked = 0; asked < locales().all().size(); ++asked) {
-            CAPTURE(asked);
-            ThreadLocale const locale(locales().all()[asked]);
-            checkTable(file, model);
+        Twins<> twins;
+        twins.file.place.write(bytes);
+        twins.file.open(READ);
+        twins.model.settings = sortedSettings(bytes);
+        twins.check();
+        inEachLocale([&] {
+            twins.check();
+            auto const checkValue = [&twins](std::wstring const& section, std::wstring const& key) {
+                checkSame(twins.file.getValue(section, key), twins.model.getValue(section, key));
+            };
             for (std::wstring const& name : names) {
-                checkSame(file.getValue(L"KEYS", name), model.getValue(L"KEYS", name));
-                checkSame(file.getValue(name, L"K"), model.getValue(name, L"K"));
-                checkSame(file.getValue(name, L"\u212A"), model.getValue(name, L"\u212A"));
+                checkValue(L"KEYS", name);
+                checkValue(name, L"K");
+                checkValue(name, L"\u212A");
             }
             // Changes as well: what exists under this locale is not added again.
-            for (wchar_t const c : folded) {
-                std::wstring const name(1, c);
-                file.createKey(name, L"k");
-                model.createKey(name, L"k");
-                file.setValue(L"keys", name + L"x", name);
-                model.setValue(L"keys", name + L"x", name);
-            }
-            file.removeKey(L"keys", L"I");
-            model.removeKey(L"keys", L"I");
-            file.removeSection(L"\u017F");
-            model.removeSection(L"\u017F");
-            checkTable(file, model);
-        }
-    }
+            twins.change([](auto& table) {
+                for (wchar_t const c : folded) {
+                    std::wstring const name(1, c);
+                    table.createKey(name, L"k");
+                    table.setValue(L"keys", name + L"x", name);
+                }
+                table.removeKey(L"keys", L"I");
+                table.removeSection(L"\u017F");
+            });
+            twins.check();
+        });
+    });
 }
 
 TEST_CASE("every character with a case is found as wcscasecmp finds it, in each locale") {
-    InitializationFile file;
     std::vector<std::wstring> keys;
-    for (locale_t const locale : locales().all()) {
+    inEachLocale([&keys] {
         for (wint_t c = 0x80; c < 0x1F000; ++c) {
-            if (::towlower_l(c, locale) == c && ::towupper_l(c, locale) == c) continue;
+            if (std::towlower(c) == c && std::towupper(c) == c) continue;
             keys.push_back(std::wstring(1, static_cast<wchar_t>(c)));
         }
-    }
+    });
     std::sort(keys.begin(), keys.end());
     keys.erase(std::unique(keys.begin(), keys.end()), keys.end());
-    {
-        ThreadLocale const c(locales().all()[0]);
-        for (std::wstring const& key : keys) file.setValue(key, L"k", key);
-    }
+    SettingsFile file;
+    for (std::wstring const& key : keys) file.setValue(key, L"k", key);
     std::size_t folds = 0;
-    for (locale_t const locale : locales().all()) {
-        ThreadLocale const current(locale);
+    std::size_t locales = 0;
+    inEachLocale([&] {
+        ++locales;
         for (std::size_t i = 0; i < keys.size(); ++i) {
             wint_t const c = static_cast<wint_t>(keys[i][0]);
             if (c >= 0x250 && i % 3 != 0) continue; // every third will do
-            for (wint_t const other : {::towlower_l(c, locale), ::towupper_l(c, locale)}) {
+            for (wint_t const other : {std::towlower(c), std::towupper(c)}) {
                 std::wstring const partner(1, static_cast<wchar_t>(other));
-                std::wstring const found = file.getValue(partner, L"K");
                 // The first that the C library takes for the same.
-                std::wstring expected;
-                for (std::wstring const& key : keys) {
-                    if (::wcscasecmp(key.c_str(), partner.c_str()) != 0) continue;
-                    expected = key;
-                    break;
-                }
-                checkSame(found, expected);
+                auto const expected =
+                    std::find_if(keys.begin(), keys.end(), [&partner](std::wstring const& key) {
+                        return ::wcscasecmp(key.c_str(), partner.c_str()) == 0;
+                    });
+                std::wstring const found = file.getValue(partner, L"K");
+                checkSame(found, expected == keys.end() ? L"" : *expected);
                 if (found != partner) ++folds;
             }
         }
-    }
-    if (locales().all().size() > 1) CHECK(folds > 0);
+    });
+    if (locales > 1) CHECK(folds > 0);
 }
 
 TEST_CASE("a locale set between open and lookup counts at the lookup") {
     std::string const previous = std::setlocale(LC_ALL, nullptr);
-    SettingsPlace const place;
-    place.write("[\xC3\x89t\xC3\xA9]\n\xC3\x85=lower comes first\n\xC3\xA5=second\n");
     REQUIRE(std::setlocale(LC_ALL, "C") != nullptr);
-    InitializationFile file(place.path());
-    file.open(READ_WRITE);
+    SettingsFile file("[\xC3\x89t\xC3\xA9]\n\xC3\x85=lower comes first\n\xC3\xA5=second\n",
+                      READ_WRITE);
     checkSame(file.getValue(L"\u00E9T\u00C9", L"\u00E5"), L"");
     CHECK(file.enumerateKeys(L"\u00E9T\u00C9").empty());
     if (std::setlocale(LC_ALL, "C.UTF-8") == nullptr) {
@@ -750,8 +601,8 @@ TEST_CASE("a locale set between open and lookup counts at the lookup") {
         file.setValue(L"\u00E9t\u00E9", L"A\u030A", L"3");
         file.createKey(L"\u00C9T\u00C9", L"\u00C5");
         file.close();
-        CHECK(place.bytes() == "[\xC3\xA9t\xC3\xA9]\nA\xCC\x8A=3\n\xC3\x85=lower comes first\n"
-                               "\xC3\xA5=second\n");
+        CHECK(file.place.bytes() == "[\xC3\xA9t\xC3\xA9]\nA\xCC\x8A=3\n"
+                                    "\xC3\x85=lower comes first\n\xC3\xA5=second\n");
     }
     REQUIRE(std::setlocale(LC_ALL, previous.c_str()) != nullptr);
 }

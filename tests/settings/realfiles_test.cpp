@@ -9,7 +9,6 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
-#include <map>
 #include <set>
 #include <sstream>
 #include <string>
@@ -27,7 +26,6 @@ using Koru::PropertyFile;
 using test::checkSame;
 using test::READ;
 using test::READ_WRITE;
-using test::sameName;
 using test::Setting;
 using test::Settings;
 using test::SettingsPlace;
@@ -66,47 +64,23 @@ std::string bytesOf(fs::path const& path) {
     return std::string(std::istreambuf_iterator<char>(in), {});
 }
 
-/// The library's answers when all of a table is asked for.
-Settings listOf(InitializationFile& file) {
-    Settings list;
-    for (std::wstring const& section : file.enumerateSections()) {
-        for (std::wstring const& key : file.enumerateKeys(section)) {
-            list.push_back({section, key, file.getValue(section, key)});
-        }
-    }
-    return list;
-}
-
-Settings listOf(PropertyFile& file) {
-    Settings list;
-    for (std::wstring const& key : file.enumerateKeys()) {
-        list.push_back({L"", key, file.getValue(key)});
-    }
-    return list;
-}
-
 /// What the model knows of a file with sections, and of one without.
 struct Sectioned {
     using File = InitializationFile;
 
-    static Settings parse(std::string const& bytes) {
-        Settings settings = test::parseSettings(bytes);
-        test::sortSettings(settings);
-        return settings;
-    }
-
+    static Settings parse(std::string const& bytes) { return test::sortedSettings(bytes); }
     static std::string text(Settings const& settings) { return test::settingsText(settings); }
+    static Settings list(Settings const& settings) { return test::spelledOnce(settings); }
 
-    /// The list of a sorted table. A section has the name that its first entry spells, and of equal
-    /// entries the first tells the value.
-    static Settings list(Settings settings) {
-        for (std::size_t i = 1; i < settings.size(); ++i) {
-            Setting const& before = settings[i - 1];
-            if (!sameName(settings[i].section, before.section)) continue;
-            settings[i].section = before.section;
-            if (sameName(settings[i].key, before.key)) settings[i].value = before.value;
+    /// The library's answers when all of a table is asked for.
+    static Settings list(File& file) {
+        Settings list;
+        for (std::wstring const& section : file.enumerateSections()) {
+            for (std::wstring const& key : file.enumerateKeys(section)) {
+                list.push_back({section, key, file.getValue(section, key)});
+            }
         }
-        return settings;
+        return list;
     }
 };
 
@@ -128,19 +102,18 @@ struct Flat {
         return text;
     }
 
-    static Settings list(Settings settings) {
-        std::map<std::wstring, std::wstring, bool (*)(std::wstring const&, std::wstring const&)>
-            first(isBefore);
-        for (Setting& s : settings) s.value = first.emplace(s.key, s.value).first->second;
-        return settings;
+    static Settings list(Settings const& settings) { return settings; }
+
+    static Settings list(File& file) {
+        Settings list;
+        for (std::wstring const& key : file.enumerateKeys()) {
+            list.push_back({L"", key, file.getValue(key)});
+        }
+        return list;
     }
 
 private:
-    static bool isBefore(std::wstring const& a, std::wstring const& b) {
-        return Koru::compare(a, b) < 0;
-    }
-
-    /// A bracket begins no header here, as it begins none behind a letter where there are sections.
+    /// A bracket begins no header here, as it begins none after a letter where there are sections.
     static void addLine(Settings& settings, std::string line) {
         std::size_t const first = line.find_first_not_of("\t ");
         bool const isBracket = first != std::string::npos && line[first] == '[';
@@ -154,10 +127,15 @@ private:
     }
 };
 
-void checkBytes(std::string const& actual, std::string const& expected) {
-    bool const same = actual == expected;
-    INFO("actual:\n", test::shown(actual), "\nexpected:\n", test::shown(expected));
-    CHECK(same);
+/// Of equal entries the first tells the value.
+Settings withFirstValues(Settings settings) {
+    auto const isBefore = [](Setting const& a, Setting const& b) {
+        int const order = Koru::compare(a.section, b.section);
+        return order < 0 || (order == 0 && Koru::compare(a.key, b.key) < 0);
+    };
+    std::set<Setting, decltype(isBefore)> first(isBefore);
+    for (Setting& s : settings) s.value = first.insert(s).first->value;
+    return settings;
 }
 
 /// Lists a file of these bytes, writes it back, and lists what was written.
@@ -168,11 +146,11 @@ void checkAs(SettingsPlace const& place, std::string const& bytes) {
     place.write(bytes);
     typename Family::File file(place.path());
     file.open(READ_WRITE);
-    checkSame(listOf(file), Family::list(expected));
+    checkSame(Family::list(file), withFirstValues(Family::list(expected)));
     file.close();
-    checkBytes(place.bytes(), rewritten);
+    checkSame(place.bytes(), rewritten);
     file.open(READ);
-    checkSame(listOf(file), Family::list(Family::parse(rewritten)));
+    checkSame(Family::list(file), withFirstValues(Family::list(Family::parse(rewritten))));
 }
 
 /// A walk through folders that holds each file against the model, as far as the bounds go.

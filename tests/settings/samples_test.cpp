@@ -13,20 +13,21 @@
 #include <string>
 #include <vector>
 
-#include <koru/initializationfile.h>
 #include <koru/string.h>
 
 #include "support/settingsfixture.h"
 #include "support/settingsmodel.h"
+#include "support/shown.h"
 #include "support/tempdir.h"
 
-using Koru::InitializationFile;
 using test::checkSame;
 using test::READ;
 using test::READ_WRITE;
 using test::Setting;
 using test::Settings;
-using test::SettingsPlace;
+using test::SettingsFile;
+using test::sortedSettings;
+using test::spelledOnce;
 
 namespace {
 
@@ -73,20 +74,29 @@ std::vector<Sample> const samples{
     theme(),
 };
 
-/// A line that counts, as bytes: the header that it stands under, its key and its value.
-struct Line {
-    std::string header;
-    std::string key;
-    std::string value;
-};
-
-bool isBlank(char c) { return c == ' ' || c == '\t'; }
-
-std::string stripped(std::string line) {
-    while (!line.empty() && isBlank(line.back())) line.pop_back();
-    while (!line.empty() && isBlank(line.front())) line.erase(line.begin());
-    return line;
+std::string bytesOf(std::string const& name) {
+    for (Sample const& sample : samples) {
+        if (sample.name == name) return sample.bytes;
+    }
+    throw std::runtime_error("there is no sample " + name);
 }
+
+/// Calls `check` with each sample and a file of its bytes, open.
+template <class Check>
+void forEachSample(unsigned long mode, Check check) {
+    for (Sample const& sample : samples) {
+        CAPTURE(sample.name);
+        SettingsFile file(sample.bytes, mode);
+        check(sample, file);
+    }
+}
+
+/// A line that counts: the header above it, its key and its value.
+struct Line {
+    std::wstring header;
+    std::wstring key;
+    std::wstring value;
+};
 
 /// The name in a header line. None of the files has a header of nothing but brackets.
 std::string headerName(std::string line) {
@@ -99,8 +109,10 @@ std::vector<Line> linesOf(std::string const& bytes) {
     std::vector<Line> lines;
     std::istringstream in(bytes);
     std::string header;
-    for (std::string raw; std::getline(in, raw);) {
-        std::string const line = stripped(raw);
+    for (std::string line; std::getline(in, line);) {
+        auto const isBlank = [](char c) { return c == ' ' || c == '\t'; };
+        while (!line.empty() && isBlank(line.back())) line.pop_back();
+        while (!line.empty() && isBlank(line.front())) line.erase(line.begin());
         char const first = line.empty() ? '#' : line[0];
         if (first == '#' || first == ';') continue;
         if (first == '[') {
@@ -111,13 +123,12 @@ std::vector<Line> linesOf(std::string const& bytes) {
         std::string key;
         std::getline(parts, key, '=');
         if (parts.eof() || key.empty() || header.empty()) continue;
-        std::string value(std::istreambuf_iterator<char>(parts), {});
-        lines.push_back({header, key, value});
+        std::string const value(std::istreambuf_iterator<char>(parts), {});
+        lines.push_back(
+            {Koru::make_wstring(header), Koru::make_wstring(key), Koru::make_wstring(value)});
     }
     return lines;
 }
-
-std::wstring wide(std::string const& text) { return Koru::make_wstring(text); }
 
 /// ASCII letters in lower case, which is all that these names need in the C locale.
 std::wstring lowered(std::wstring text) {
@@ -135,28 +146,6 @@ std::wstring respelt(std::wstring text) {
     return text;
 }
 
-Settings sortedSettings(std::string const& bytes) {
-    Settings settings = test::parseSettings(bytes);
-    test::sortSettings(settings);
-    return settings;
-}
-
-/// A section is written once, as its first entry spells it.
-Settings spelledOnce(Settings sorted) {
-    for (std::size_t i = 1; i < sorted.size(); ++i) {
-        std::wstring const& before = sorted[i - 1].section;
-        if (test::sameName(sorted[i].section, before)) sorted[i].section = before;
-    }
-    return sorted;
-}
-
-std::string bytesOf(std::string const& name) {
-    for (Sample const& sample : samples) {
-        if (sample.name == name) return sample.bytes;
-    }
-    throw std::runtime_error("there is no sample " + name);
-}
-
 } // namespace
 
 TEST_CASE("every sample is in the table of samples, with its entries and sections") {
@@ -167,7 +156,7 @@ TEST_CASE("every sample is in the table of samples, with its entries and section
         CAPTURE(sample.name);
         std::vector<Line> const lines = linesOf(sample.bytes);
         std::set<std::wstring> sections;
-        for (Line const& line : lines) sections.insert(lowered(wide(line.header)));
+        for (Line const& line : lines) sections.insert(lowered(line.header));
         CHECK(lines.size() == sample.entries);
         CHECK(sections.size() == sample.sections);
     }
@@ -187,90 +176,67 @@ TEST_CASE("the samples have the traits that they are there for") {
 }
 
 TEST_CASE("every key line of a sample comes out as it stands there") {
-    SettingsPlace const place;
-    for (Sample const& sample : samples) {
-        CAPTURE(sample.name);
-        place.write(sample.bytes);
-        InitializationFile file(place.path());
-        file.open(READ);
+    forEachSample(READ, [](Sample const& sample, SettingsFile& file) {
         CHECK(file.enumerateSections().size() == sample.sections);
         // Of equal entries the first of the file comes first; removing it uncovers the next.
         for (Line const& line : linesOf(sample.bytes)) {
-            CAPTURE(line.header);
-            CAPTURE(line.key);
-            std::wstring const header = wide(line.header);
-            std::wstring const key = wide(line.key);
-            checkSame(file.getValue(header, key), wide(line.value));
-            checkSame(file.getValue(respelt(header), respelt(key)), wide(line.value));
-            file.removeKey(header, key);
+            CAPTURE(test::shown(line.header));
+            CAPTURE(test::shown(line.key));
+            checkSame(file.getValue(line.header, line.key), line.value);
+            checkSame(file.getValue(respelt(line.header), respelt(line.key)), line.value);
+            file.removeKey(line.header, line.key);
         }
         CHECK(file.enumerateSections().empty());
         file.close();
-        CHECK(place.bytes() == sample.bytes);
-    }
+        CHECK(file.place.bytes() == sample.bytes);
+    });
 }
 
 TEST_CASE("sections and keys of a sample are listed once per line, in order, as spelt") {
-    SettingsPlace const place;
-    for (Sample const& sample : samples) {
-        CAPTURE(sample.name);
+    forEachSample(READ, [](Sample const& sample, SettingsFile& file) {
         // Section and key in lower case, then the number of the line, sort as the table does.
         std::map<std::wstring, std::multimap<std::wstring, Line>> sorted;
         for (Line const& line : linesOf(sample.bytes)) {
-            sorted[lowered(wide(line.header))].emplace(lowered(wide(line.key)), line);
+            sorted[lowered(line.header)].emplace(lowered(line.key), line);
         }
         std::vector<std::wstring> sections;
-        place.write(sample.bytes);
-        InitializationFile file(place.path());
-        file.open(READ);
         for (auto const& section : sorted) {
             std::vector<std::wstring> keys;
-            for (auto const& key : section.second) keys.push_back(wide(key.second.key));
+            for (auto const& key : section.second) keys.push_back(key.second.key);
             checkSame(file.enumerateKeys(section.first), keys);
-            sections.push_back(wide(section.second.begin()->second.header));
+            sections.push_back(section.second.begin()->second.header);
         }
         checkSame(file.enumerateSections(), sections);
-    }
+    });
 }
 
 TEST_CASE("a sample that was written back reads the same, and is written the same again") {
-    SettingsPlace const place;
-    for (Sample const& sample : samples) {
-        CAPTURE(sample.name);
-        place.write(sample.bytes);
-        InitializationFile file(place.path());
-        file.open(READ_WRITE);
+    forEachSample(READ_WRITE, [](Sample const& sample, SettingsFile& file) {
         file.close();
-        std::string const rewritten = place.bytes();
+        std::string const rewritten = file.place.bytes();
         Settings const expected = sortedSettings(sample.bytes);
         CHECK(expected.size() == sample.entries);
         checkSame(test::parseSettings(rewritten), spelledOnce(expected));
         CHECK(rewritten == test::settingsText(expected));
-
         file.open(READ_WRITE);
         file.synchronize();
         file.close();
-        CHECK(place.bytes() == rewritten);
-    }
+        CHECK(file.place.bytes() == rewritten);
+    });
 }
 
 TEST_CASE("changing one value of a sample leaves all others") {
-    SettingsPlace const place;
-    for (Sample const& sample : samples) {
-        CAPTURE(sample.name);
+    forEachSample(READ_WRITE, [](Sample const& sample, SettingsFile& file) {
         Settings expected = sortedSettings(sample.bytes);
         Setting& changed = expected[expected.size() / 2];
-        place.write(sample.bytes);
-        InitializationFile file(place.path());
-        file.open(READ_WRITE);
         // Not one that has an equal before it: the first is the one that is changed.
         checkSame(file.getValue(changed.section, changed.key), changed.value);
         changed.value = L"\u00C4nderung = " + changed.value;
         file.setValue(changed.section, changed.key, changed.value);
         file.synchronize();
-        CHECK(place.bytes() == test::settingsText(expected));
+        CHECK(file.place.bytes() == test::settingsText(expected));
         checkSame(test::drain(file), spelledOnce(expected));
-    }
+    });
 }
 
 TEST_CASE("samples say what a reader finds in them") {
@@ -339,13 +305,10 @@ TEST_CASE("samples say what a reader finds in them") {
         {"dachboden.cfg", L"Raw", L"over", L"/"},
         {"dachboden.cfg", L"Raw", L"last", L"without an end of the line"},
     };
-    SettingsPlace const place;
     for (Row const& row : rows) {
         CAPTURE(row.file);
         CAPTURE(test::shown(std::wstring(row.key)));
-        place.write(bytesOf(row.file));
-        InitializationFile file(place.path());
-        file.open(READ);
+        SettingsFile file(bytesOf(row.file));
         checkSame(file.getValue(row.section, row.key), row.value);
     }
 }

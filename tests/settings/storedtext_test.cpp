@@ -4,7 +4,6 @@
 
 #include <cstddef>
 #include <memory>
-#include <random>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -12,6 +11,7 @@
 #include <koru/string.h>
 
 #include "settings/storedtext.h"
+#include "support/choices.h"
 #include "support/locales.h"
 #include "support/shown.h"
 
@@ -26,16 +26,20 @@ std::wstring wideString(wchar_t const* s, std::size_t size) { return std::wstrin
 } // namespace Koru
 
 using Koru::StoredText;
+using test::Dice;
 using test::inEachLocale;
+using namespace std::string_literals;
 
 namespace {
 
 /// One text in both forms. The bytes are in memory that ends where they end, so that a sanitizer
-/// sees what is read behind them.
+/// sees what is read after them.
 class Text {
 public:
-    explicit Text(std::wstring const& characters)
-        : string_(characters), bytes_(exactly(Koru::make_string(characters))) {}
+    explicit Text(std::wstring const& characters) : string_(characters) {
+        std::string const bytes = Koru::make_string(characters);
+        bytes_.assign(bytes.begin(), bytes.end());
+    }
     Text(Text const&) = delete;
     Text& operator=(Text const&) = delete;
 
@@ -44,23 +48,15 @@ public:
     StoredText wide() { return StoredText(&string_); }
 
 private:
-    static std::vector<char> exactly(std::string const& bytes) {
-        return std::vector<char>(bytes.begin(), bytes.end());
-    }
-
     std::wstring string_;
     std::vector<char> bytes_;
 };
 
 int sign(int value) { return (value > 0) - (value < 0); }
 
-/// How the library's own rule orders them, character by character.
-int plainOrder(std::wstring const& a, std::wstring const& b) {
-    return sign(Koru::compare(a.c_str(), b.c_str()));
-}
-
+/// The texts compare as the library's own rule orders them, character by character.
 void checkPair(Text& a, Text& b) {
-    int const order = plainOrder(a.string(), b.string());
+    int const order = sign(Koru::compare(a.string().c_str(), b.string().c_str()));
     bool same = true;
     for (StoredText const& x : {a.narrow(), a.wide()}) {
         for (StoredText const& y : {b.narrow(), b.wide()}) same &= sign(compare(x, y)) == order;
@@ -77,7 +73,7 @@ std::wstring const odd =
 
 } // namespace
 
-TEST_CASE("texts of up to two odd characters compare as wide strings do, behind any beginning") {
+TEST_CASE("texts of up to two odd characters compare as wide strings do, after any beginning") {
     std::vector<std::wstring> names = {L""};
     for (std::size_t i = 0; names[i].size() < 2; ++i) {
         for (wchar_t const c : odd) names.push_back(std::wstring(names[i]) + c);
@@ -96,20 +92,20 @@ TEST_CASE("texts of up to two odd characters compare as wide strings do, behind 
 }
 
 TEST_CASE("random texts that are alike but for case, a character or the end compare likewise") {
-    std::mt19937 random(1);
-    inEachLocale([&random] {
+    std::wstring printable;
+    for (wchar_t c = L' '; c < 0x7F; ++c) printable += c;
+    Dice dice(1);
+    inEachLocale([&] {
         for (int i = 0; i < 20000; ++i) {
-            std::wstring a(random() % 70, L'\0');
-            bool const plain = random() % 2 == 0;
-            for (wchar_t& c : a)
-                c = plain ? static_cast<wchar_t>(' ' + random() % 95) : odd[random() % odd.size()];
+            std::wstring const a = dice.text(dice.oneIn(2) ? printable : odd, 69);
             std::wstring b = a;
-            std::size_t const one = random() % (a.size() + 1);
-            auto const change = random() % 4;
+            std::size_t const one = dice.below(a.size() + 1);
+            std::size_t const change = dice.below(4);
             if (change == 1) b.resize(one);
-            if (change == 2 && one != a.size()) b[one] = odd[random() % odd.size()];
-            if (change == 3)
-                for (wchar_t& c : b) c = c < 0x80 && (c | 0x20) >= 'a' ? c ^ 0x20 : c;
+            if (change == 2 && one != a.size()) b[one] = dice.from(odd);
+            for (wchar_t& c : b) {
+                if (change == 3 && c < 0x80 && (c | 0x20) >= 'a') c ^= 0x20;
+            }
             Text first(a);
             Text second(b);
             checkPair(first, second);
@@ -118,16 +114,18 @@ TEST_CASE("random texts that are alike but for case, a character or the end comp
 }
 
 TEST_CASE("a name that is looked for ends at its first NUL, and so does one that was set") {
-    Text const text(L"name");
-    CHECK(areEqual(text.narrow(), std::wstring(L"NAME\0more", 9)));
-    CHECK(!areEqual(text.narrow(), std::wstring(L"nam\0", 4)));
-    CHECK(!areEqual(text.narrow(), std::wstring(L"nam\0e", 5)));
-    std::wstring set(L"name\0is long", 12);
-    CHECK(areEqual(StoredText(&set), L"name"));
-    CHECK(!areEqual(StoredText(&set), L""));
+    Text text(L"name");
+    std::wstring set = L"name\0is long"s;
+    for (StoredText const& name : {text.narrow(), text.wide(), StoredText(&set)}) {
+        CHECK(areEqual(name, L"name\0more"s));
+        CHECK(areEqual(name, L"name"));
+        CHECK(!areEqual(name, L"nam\0"s));
+        CHECK(!areEqual(name, L"nam\0e"s));
+        CHECK(!areEqual(name, L""));
+    }
     CHECK(areEqual(StoredText(), std::wstring()));
     CHECK(!areEqual(StoredText(), L"x"));
-    CHECK(areEqual(StoredText(), std::wstring(L"\0x", 2)));
+    CHECK(areEqual(StoredText(), L"\0x"s));
 }
 
 TEST_CASE("text is plain unless a byte of it is NUL or beyond ASCII, at any place") {
