@@ -31,13 +31,13 @@ using test::forEachText;
 using test::inEachLocale;
 using test::loaded;
 using test::messageOf;
+using test::Place;
 using test::READ;
 using test::READ_WRITE;
 using test::Setting;
 using test::Settings;
 using test::SettingsFile;
 using test::SettingsFileModel;
-using test::SettingsPlace;
 using test::sortedSettings;
 using test::Twins;
 using test::WRITE;
@@ -47,7 +47,7 @@ namespace {
 
 /// Opens a file of these bytes, compares the table with the model, writes it back and compares the
 /// bytes, then reads and compares again.
-void checkFile(SettingsPlace const& place, std::string const& bytes) {
+void checkFile(Place const& place, std::string const& bytes) {
     place.write(bytes);
     InitializationFile file(place.path());
     file.open(READ_WRITE);
@@ -68,7 +68,7 @@ void checkFile(SettingsPlace const& place, std::string const& bytes) {
 } // namespace
 
 TEST_CASE("every line of up to five characters of the syntax is read as the model reads it") {
-    SettingsPlace const place;
+    Place const place;
     std::string bytes;
     std::size_t lines = 0;
     forEachText("[]=#;a\t ", 5, [&](std::string const& line) {
@@ -83,7 +83,7 @@ TEST_CASE("every line of up to five characters of the syntax is read as the mode
 }
 
 TEST_CASE("every line of up to four characters of the syntax is read at the end of a file") {
-    SettingsPlace const place;
+    Place const place;
     forEachText("[]=#;a\t ", 4, [&place](std::string const& line) {
         CAPTURE(line);
         std::string const bytes = "[h]\nb=1\n" + line;
@@ -92,7 +92,7 @@ TEST_CASE("every line of up to four characters of the syntax is read at the end 
 }
 
 TEST_CASE("every line of up to three bytes that matter to UTF-8 is read as the model reads it") {
-    SettingsPlace const place;
+    Place const place;
     std::string bytes;
     std::size_t lines = 0;
     forEachText("[=a\0\x80\xBF\xC0\xC3\xE2\xFF"s, 3, [&](std::string const& line) {
@@ -107,7 +107,7 @@ TEST_CASE("every line of up to three bytes that matter to UTF-8 is read as the m
 }
 
 TEST_CASE("random files are read and written as the model does") {
-    SettingsPlace const place;
+    Place const place;
     std::string const syntax = "[]=#;aAb\t \r\n\0\x80\xC3\xA9\xE2\xFF\xC0"s;
     for (unsigned seed = 1; seed <= 1500; ++seed) {
         CAPTURE(seed);
@@ -120,7 +120,7 @@ TEST_CASE("random files are read and written as the model does") {
 }
 
 TEST_CASE("random files of likely lines are read and written as the model does") {
-    SettingsPlace const place;
+    Place const place;
     std::vector<std::string> const pieces{
         "[",     "]",     "=",       "#",        ";",        "\n",   "\n",       "\n",
         "[a]\n", "[A]\n", "[b c]\n", "key",      "KEY",      "Key2", "=value",   " ",

@@ -24,11 +24,11 @@
 using Koru::InitializationFile;
 using Koru::PropertyFile;
 using test::checkSame;
+using test::Place;
 using test::READ;
 using test::READ_WRITE;
 using test::Setting;
 using test::Settings;
-using test::SettingsPlace;
 
 namespace fs = std::filesystem;
 
@@ -140,7 +140,7 @@ Settings withFirstValues(Settings settings) {
 
 /// Lists a file of these bytes, writes it back, and lists what was written.
 template <class Family>
-void checkAs(SettingsPlace const& place, std::string const& bytes) {
+void checkAs(Place const& place, std::string const& bytes) {
     Settings const expected = Family::parse(bytes);
     std::string const rewritten = Family::text(expected);
     place.write(bytes);
@@ -174,7 +174,7 @@ public:
     std::size_t bytes() const { return bytes_; }
 
 private:
-    SettingsPlace place_;
+    Place place_;
     std::error_code error_;
     std::size_t entries_ = 0;
     std::size_t files_ = 0;

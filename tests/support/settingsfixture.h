@@ -5,7 +5,6 @@
 #include <doctest/doctest.h>
 
 #include <cstddef>
-#include <filesystem>
 #include <initializer_list>
 #include <stdexcept>
 #include <string>
@@ -22,27 +21,11 @@ unsigned long const READ = Koru::File::READ;
 unsigned long const WRITE = Koru::File::WRITE;
 unsigned long const READ_WRITE = Koru::File::READ | Koru::File::WRITE;
 
-/// A settings file's place, without the file at first.
-class SettingsPlace {
-public:
-    std::string const& path() const { return path_; }
-    TempDir const& directory() const { return directory_; }
-    /// Writes a new file; some file systems are slow in emptying one that is there.
-    void write(std::string const& bytes) const {
-        std::filesystem::remove(path_);
-        writeFile(path_, bytes);
-    }
-    std::string bytes() const { return readFile(path_); }
-    bool exists() const { return std::filesystem::exists(path_); }
-
-private:
-    TempDir directory_;
-    std::string path_ = directory_ / "settings.ini";
-};
+using SettingsPlace = Place;
 
 /// The place of a file object, made before it and removed after it.
 struct HasPlace {
-    SettingsPlace const place;
+    Place const place;
 };
 
 /// A settings file of its own. With bytes it is there and open, without it is not.
@@ -71,7 +54,7 @@ inline Settings drain(Koru::InitializationFile& file) {
 }
 
 /// The table that a file of these bytes is read into.
-inline Settings loaded(SettingsPlace const& place, std::string const& bytes) {
+inline Settings loaded(Place const& place, std::string const& bytes) {
     place.write(bytes);
     Koru::InitializationFile file(place.path());
     file.open(READ);
