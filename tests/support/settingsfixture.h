@@ -21,8 +21,6 @@ unsigned long const READ = Koru::File::READ;
 unsigned long const WRITE = Koru::File::WRITE;
 unsigned long const READ_WRITE = Koru::File::READ | Koru::File::WRITE;
 
-using SettingsPlace = Place;
-
 /// The place of a file object, made before it and removed after it.
 struct HasPlace {
     Place const place;
@@ -103,7 +101,7 @@ inline void checkEntries(Koru::InitializationFile& file, char const* expected) {
 }
 
 /// Every section, key and value that the library gives is the model's.
-inline void checkTable(Koru::InitializationFile& file, SettingsTableModel const& model) {
+inline void checkTable(Koru::InitializationFile& file, SettingsTableModel& model) {
     std::vector<std::wstring> const sections = model.enumerateSections();
     checkSame(file.enumerateSections(), sections);
     for (std::wstring const& section : sections) {

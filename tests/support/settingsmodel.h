@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cstddef>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -48,17 +49,16 @@ inline bool sameName(std::wstring const& a, std::wstring const& b) {
 /// nothing.
 inline void parseSettingsLine(std::string line, std::wstring& section, std::wstring& key,
                               std::wstring& value) {
-    std::size_t const last = line.find_last_not_of("\t ");
-    if (last != std::string::npos) line.erase(last + 1);
-    std::size_t const first = line.find_first_not_of("\t ");
-    if (first != std::string::npos) line.erase(0, first);
-
+    auto const eraseAtEnds = [&line](char const* atStart, char const* atEnd) {
+        std::size_t const last = line.find_last_not_of(atEnd);
+        if (last != std::string::npos) line.erase(last + 1);
+        std::size_t const first = line.find_first_not_of(atStart);
+        if (first != std::string::npos) line.erase(0, first);
+    };
+    eraseAtEnds("\t ", "\t ");
     if (line.empty() || line[0] == '#' || line[0] == ';') return;
     if (line[0] == '[') {
-        std::size_t const beforeRun = line.find_last_not_of(']');
-        if (beforeRun != std::string::npos) line.erase(beforeRun + 1);
-        std::size_t const afterRun = line.find_first_not_of('[');
-        if (afterRun != std::string::npos) line.erase(0, afterRun);
+        eraseAtEnds("[", "]");
         section = Koru::make_wstring(line);
         return;
     }
@@ -72,18 +72,12 @@ inline void parseSettingsLine(std::string line, std::wstring& section, std::wstr
 inline Settings parseSettings(std::string const& bytes) {
     Settings settings;
     std::wstring section;
-    std::size_t at = 0;
-    while (at < bytes.size()) {
-        if (bytes[at] == '\n') {
-            ++at;
-            continue;
-        }
-        std::size_t const end = std::min(bytes.find('\n', at), bytes.size());
+    std::istringstream in(bytes);
+    for (std::string line; std::getline(in, line);) {
         std::wstring key;
         std::wstring value;
-        parseSettingsLine(bytes.substr(at, end - at), section, key, value);
+        parseSettingsLine(line, section, key, value);
         if (!section.empty() && !key.empty()) settings.push_back({section, key, value});
-        at = end;
     }
     return settings;
 }
@@ -116,13 +110,12 @@ inline Settings spelledOnce(Settings sorted) {
 /// The bytes that a table in this order is written as.
 inline std::string settingsText(Settings const& settings) {
     std::string text;
-    Setting const* previous = nullptr;
-    for (Setting const& entry : settings) {
-        if (previous == nullptr || !sameName(entry.section, previous->section)) {
-            text += "[" + Koru::make_string(entry.section) + "]\n";
+    for (std::size_t i = 0; i < settings.size(); ++i) {
+        if (i == 0 || !sameName(settings[i].section, settings[i - 1].section)) {
+            text += "[" + Koru::make_string(settings[i].section) + "]\n";
         }
-        text += Koru::make_string(entry.key) + "=" + Koru::make_string(entry.value) + "\n";
-        previous = &entry;
+        text += Koru::make_string(settings[i].key) + "=" + Koru::make_string(settings[i].value);
+        text += "\n";
     }
     return text;
 }
@@ -143,15 +136,13 @@ public:
     }
 
     void createSection(std::wstring const& section) {
-        for (Setting const& entry : settings) {
-            if (sameName(entry.section, section)) return;
-        }
-        settings.push_back({section, L"", L""});
+        if (enumerateKeys(section).empty()) settings.push_back({section, L"", L""});
     }
 
     void removeSection(std::wstring const& section) {
         for (std::size_t i = 0; i < settings.size(); ++i) {
-            if (sameName(settings[i].section, section)) removeAt(i);
+            if (!sameName(settings[i].section, section)) continue;
+            settings.erase(settings.begin() + static_cast<std::ptrdiff_t>(i));
         }
     }
 
@@ -164,38 +155,30 @@ public:
     }
 
     void createKey(std::wstring const& section, std::wstring const& key) {
-        if (find(section, key) == settings.size()) settings.push_back({section, key, L""});
+        if (find(section, key) == nullptr) settings.push_back({section, key, L""});
     }
 
     void removeKey(std::wstring const& section, std::wstring const& key) {
-        std::size_t const at = find(section, key);
-        if (at < settings.size()) removeAt(at);
+        Setting const* const found = find(section, key);
+        if (found != nullptr) settings.erase(settings.begin() + (found - settings.data()));
     }
 
-    std::wstring getValue(std::wstring const& section, std::wstring const& key) const {
-        std::size_t const at = find(section, key);
-        return at < settings.size() ? settings[at].value : std::wstring();
+    std::wstring getValue(std::wstring const& section, std::wstring const& key) {
+        Setting const* const found = find(section, key);
+        return found != nullptr ? found->value : std::wstring();
     }
 
     void setValue(std::wstring const& section, std::wstring const& key, std::wstring const& value) {
-        std::size_t const at = find(section, key);
-        if (at < settings.size()) {
-            settings[at].value = value;
-        } else {
-            settings.push_back({section, key, value});
-        }
+        createKey(section, key);
+        find(section, key)->value = value;
     }
 
 private:
-    std::size_t find(std::wstring const& section, std::wstring const& key) const {
-        for (std::size_t i = 0; i < settings.size(); ++i) {
-            if (sameName(settings[i].section, section) && sameName(settings[i].key, key)) return i;
+    Setting* find(std::wstring const& section, std::wstring const& key) {
+        for (Setting& s : settings) {
+            if (sameName(s.section, section) && sameName(s.key, key)) return &s;
         }
-        return settings.size();
-    }
-
-    void removeAt(std::size_t at) {
-        settings.erase(settings.begin() + static_cast<std::ptrdiff_t>(at));
+        return nullptr;
     }
 };
 
