@@ -8,7 +8,6 @@
 #include <locale.h>
 #include <stdlib.h>
 
-#include <filesystem>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -40,22 +39,43 @@ private:
 
 struct NamedLocale {
     std::string name;
+    std::string path; ///< for LOCPATH, if the C library does not find it elsewhere
     locale_t locale;
+};
+
+/// The environment variable as long as the C library looks for a locale.
+class LocalePath {
+public:
+    explicit LocalePath(std::string const& path) {
+        if (!path.empty()) ::setenv("LOCPATH", path.c_str(), 1);
+    }
+    LocalePath(LocalePath const&) = delete;
+    LocalePath& operator=(LocalePath const&) = delete;
+    ~LocalePath() { ::unsetenv("LOCPATH"); }
+};
+
+/// A locale for all threads that have none of their own, for the time of a scope.
+class ProcessLocale {
+public:
+    explicit ProcessLocale(NamedLocale const& locale) {
+        LocalePath const path(locale.path);
+        REQUIRE(::setlocale(LC_ALL, locale.name.c_str()) != nullptr);
+    }
+    ProcessLocale(ProcessLocale const&) = delete;
+    ProcessLocale& operator=(ProcessLocale const&) = delete;
+    ~ProcessLocale() { ::setlocale(LC_ALL, "C"); }
 };
 
 class Locales {
 public:
     Locales() {
         std::istringstream installed(test::execute("/usr/bin/locale", {"locale", "-a"}).out);
-        for (std::string name; std::getline(installed, name);) add(name);
-        if (all_.empty()) add("C");
+        for (std::string name; std::getline(installed, name);) add(name, "");
+        if (all_.empty()) add("C", "");
         // Turkish pairs i and I otherwise, and in the Latin ones bytes above 0x7F have case.
         compile("tr_TR.UTF-8", "tr_TR", "UTF-8");
         compile("tr_TR.ISO-8859-9", "tr_TR", "ISO-8859-9");
         compile("de_DE.ISO-8859-1", "de_DE", "ISO-8859-1");
-        ::setenv("LOCPATH", directory_.path().c_str(), 1);
-        for (std::string const& name : compiled_) add(name);
-        ::unsetenv("LOCPATH");
     }
     Locales(Locales const&) = delete;
     Locales& operator=(Locales const&) = delete;
@@ -69,34 +89,31 @@ private:
     void compile(std::string const& name, std::string const& source, std::string const& charset) {
         test::execute("/usr/bin/localedef",
                       {"localedef", "--quiet", "-i", source, "-f", charset, directory_ / name});
-        if (std::filesystem::exists(directory_ / name))
-            compiled_.push_back(name);
-        else
-            tellMissing(name);
+        add(name, directory_.path());
     }
 
-    void add(std::string const& name) {
+    void add(std::string const& name, std::string const& path) {
+        LocalePath const scope(path);
         locale_t const locale = ::newlocale(LC_ALL_MASK, name.c_str(), nullptr);
         if (locale != nullptr)
-            all_.push_back({name, locale});
+            all_.push_back({name, path, locale});
         else
-            tellMissing(name);
-    }
-
-    static void tellMissing(std::string const& name) {
-        MESSAGE("not tested, as this machine lacks it: locale " << name);
+            MESSAGE("not tested, as this machine lacks it: locale " << name);
     }
 
     TempDir directory_;
-    std::vector<std::string> compiled_;
     std::vector<NamedLocale> all_;
 };
+
+inline std::vector<NamedLocale> const& allLocales() {
+    static Locales const locales; // compiling one takes a second
+    return locales.all();
+}
 
 /// Calls `use` under each of the locales in turn.
 template <class Use>
 void inEachLocale(Use use) {
-    static Locales const locales; // compiling one takes a second
-    for (NamedLocale const& each : locales.all()) {
+    for (NamedLocale const& each : allLocales()) {
         CAPTURE(each.name);
         ThreadLocale const locale(each.locale);
         use();
