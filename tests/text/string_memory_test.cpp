@@ -1,6 +1,5 @@
-// How much memory the conversions take, and what comes of text that is too long for a string. A
-// file of its own, since the operators that allocate memory are replaced for the whole executable
-// and the libraries it loaded.
+// How much memory the string functions take, and what comes of text that no string can hold. A
+// program of its own, since the operators that allocate are replaced for all of it.
 #include <koru/string.h>
 
 #include <doctest/doctest.h>
@@ -10,44 +9,21 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <cstdlib>
+#include <functional>
 #include <new>
 #include <string>
 #include <vector>
 
+#include "support/failingmemory.h"
 #include "support/throws.h"
+#include "text/convert.h"
+
+using namespace test;
 
 namespace {
 
-std::size_t allocated = 0; ///< since it was last set to 0
-void* nextHuge = nullptr;  ///< handed out for the next huge allocation, if it is set
-constexpr std::size_t HUGE = 1U << 30;
-
-void* _allocate(std::size_t size) {
-    allocated += size;
-    if (size >= HUGE && nextHuge != nullptr) return nextHuge;
-    void* const memory = std::malloc(size == 0 ? 1 : size);
-    if (memory == nullptr) throw std::bad_alloc();
-    return memory;
-}
-
-void _free(void* memory) noexcept {
-    if (memory != nextHuge) std::free(memory);
-}
-
-} // namespace
-
-void* operator new(std::size_t size) { return _allocate(size); }
-void* operator new[](std::size_t size) { return _allocate(size); }
-void operator delete(void* memory) noexcept { _free(memory); }
-void operator delete[](void* memory) noexcept { _free(memory); }
-void operator delete(void* memory, std::size_t) noexcept { _free(memory); }
-void operator delete[](void* memory, std::size_t) noexcept { _free(memory); }
-
-namespace {
-
-/// The same piece of memory again and again, one behind the other, followed by zeros: more text
-/// than a machine may have memory for.
+/// The same piece of memory again and again, one after the other, followed by zeros: more text than
+/// a machine may have memory for.
 class Repeated {
 public:
     template <class Char>
@@ -58,6 +34,7 @@ public:
         void* const memory = ::mmap(nullptr, size_ + PIECE, PROT_READ | PROT_WRITE,
                                     MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0);
         if (memory != MAP_FAILED) memory_ = static_cast<char*>(memory);
+        if (memory_ == nullptr) MESSAGE("not tested: the address space has no room for the text");
         for (std::size_t at = 0; memory_ != nullptr && at < size_; at += PIECE) {
             REQUIRE(::mmap(memory_ + at, PIECE, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_FIXED,
                            file, 0) != MAP_FAILED);
@@ -80,77 +57,104 @@ private:
     char* memory_ = nullptr;
 };
 
-/// The outcome of a conversion that has to run out of memory.
-template <class Convert>
-std::string outcome(Convert convert) {
-    return test::messageOf<std::bad_alloc>(convert);
+/// Whether there can be text that is too long for a string.
+bool canBeTooLong() {
+    if (sizeof(void*) == 4) return true;
+    MESSAGE("not tested: with 64 bits no memory holds a text too long for a string");
+    return false;
 }
 
-constexpr bool NARROW_ADDRESSES = sizeof(void*) == 4;
+/// Holds what comes of a text that is too long for a string.
+template <class Char, class Convert>
+void checkTooLong(Char c, std::size_t count, Convert convert) {
+    CAPTURE(count);
+    Repeated const text(c, count);
+    if (text.memory() == nullptr) return;
+    auto const* const s = static_cast<Char const*>(text.memory());
+    CHECK(messageOf<std::bad_alloc>([&] { convert(s); }) == "std::bad_alloc");
+}
+
+std::size_t const TOO_MANY_BYTES = std::string().max_size() + 1;
+std::size_t const TOO_MANY_CHARACTERS = std::wstring().max_size() + 1;
+std::size_t const TWO_GIB = std::size_t{1} << 31; // too much for any string of 32 bits
 
 } // namespace
 
-TEST_CASE("make_string takes no memory for what stands behind a NUL") {
+TEST_CASE("make_string takes no memory for what comes after a NUL") {
     for (wchar_t const c : {L'x', L'\u00E9', L'\u4E2D', L'\U0001F600', wchar_t{-2}}) {
         std::wstring text(2000, c);
         text += L'\0';
         text.append(5000000, c);
-        allocated = 0;
+        AllocatedBytes const allocated;
         std::string const result = Koru::make_string(text);
-        CHECK(allocated < 20000);
+        CHECK(allocated.count() < 20000);
         CHECK((result == Koru::make_string(std::wstring(2000, c))));
     }
 }
 
-TEST_CASE("make_wstring takes no memory for what stands behind a NUL") {
+TEST_CASE("make_wstring takes no memory for what comes after a NUL") {
     std::string text(2000, 'x');
     text += '\0';
     text.append(5000000, 'x');
-    allocated = 0;
+    AllocatedBytes const allocated;
     CHECK((Koru::make_wstring(text) == std::wstring(2000, L'x')));
-    CHECK(allocated < 40000);
+    CHECK(allocated.count() < 40000);
 }
 
-TEST_CASE("narrow text too long for a wide string is want of memory" *
-          doctest::skip(!NARROW_ADDRESSES)) {
-    std::size_t const tooMany = std::wstring().max_size() + 1;
-    for (char const c : {'x', '\xC3'}) {
-        Repeated const text(c, c == 'x' ? tooMany : 2 * tooMany - (1U << 21));
-        if (text.memory() == nullptr) {
-            MESSAGE("no room for the text");
-            continue;
-        }
-        CHECK(outcome([&] { Koru::make_wstring(static_cast<char const*>(text.memory())); }) ==
-              "std::bad_alloc");
+TEST_CASE("exhausted memory escapes as bad_alloc and leaves the functions usable") {
+    std::size_t const size = 100000;
+    std::string const narrow(size, 'a');
+    std::wstring const wide(size, L'a');
+    std::function<void()> const conversions[] = {[&] { Koru::make_string(wide); },
+                                                 [&] { Koru::make_string(wide.c_str()); },
+                                                 [&] { Koru::make_wstring(narrow); },
+                                                 [&] { Koru::make_wstring(narrow.c_str()); },
+                                                 [&] { Koru::make_string(narrow.c_str()); },
+                                                 [&] { Koru::make_wstring(wide.c_str()); },
+                                                 [&] { Koru::wideString(wide.data(), size); }};
+    for (std::function<void()> const& convert : conversions) {
+        forEachFailure([&](MemoryPlan const& plan) {
+            std::string const outcome = runOutOfMemory(plan, convert);
+            CHECK(outcome == (memoryRanOut() ? "std::bad_alloc" : "done"));
+            return memoryRanOut();
+        });
+        CHECK(runOutOfMemory(0, Failing::ONE, convert) == "std::bad_alloc");
+    }
+    CHECK(Koru::make_string(L"\u00E9") == "\xC3\xA9");
+    CHECK((Koru::make_wstring("\xC3\xA9") == L"\u00E9"));
+}
+
+TEST_CASE("narrow text too long for a narrow string is want of memory") {
+    if (!canBeTooLong()) return;
+    for (std::size_t const size : {TOO_MANY_BYTES, TWO_GIB}) {
+        checkTooLong('x', size, [](char const* s) { Koru::make_string(s); });
     }
 }
 
-TEST_CASE("wide text whose UTF-8 is too long for a string is want of memory" *
-          doctest::skip(!NARROW_ADDRESSES)) {
-    // Whole pieces, or the NUL behind the text would end each of them.
+TEST_CASE("narrow text too long for a wide string is want of memory") {
+    if (!canBeTooLong()) return;
+    for (char const c : {'x', '\xC3'}) {
+        std::size_t const count =
+            c == 'x' ? TOO_MANY_CHARACTERS : 2 * TOO_MANY_CHARACTERS - (1U << 21);
+        checkTooLong(c, count, [](char const* s) { Koru::make_wstring(s); });
+    }
+}
+
+TEST_CASE("wide text whose UTF-8 is too long for a string is want of memory") {
+    if (!canBeTooLong()) return;
+    // Whole pieces, or the NUL after the text would end each of them.
     std::size_t const count = (std::string().max_size() / 6 & ~0x3FFFFU) + 0x40000;
     Repeated const memory(L'\x7FFFFFFF', count);
-    if (memory.memory() == nullptr) {
-        MESSAGE("no room for the text");
-        return;
-    }
-    nextHuge = memory.memory();
-    {
-        std::wstring const text(count, L'\x7FFFFFFF');
-        nextHuge = nullptr;
-        CHECK(outcome([&] { Koru::make_string(text); }) == "std::bad_alloc");
-        nextHuge = memory.memory();
-    }
-    nextHuge = nullptr;
+    if (memory.memory() == nullptr) return;
+    ReserveForHugeBlock const reserve(memory.memory());
+    std::wstring const text(count, L'\x7FFFFFFF');
+    CHECK(messageOf<std::bad_alloc>([&] { Koru::make_string(text); }) == "std::bad_alloc");
 }
 
-TEST_CASE("wide text too long for a string is want of memory" * doctest::skip(!NARROW_ADDRESSES)) {
-    Repeated const text(L'x', std::wstring().max_size() + 1);
-    if (text.memory() == nullptr) {
-        MESSAGE("no room for the text");
-        return;
+TEST_CASE("wide text too long for a string is want of memory") {
+    if (!canBeTooLong()) return;
+    for (std::size_t const count : {TOO_MANY_CHARACTERS, TWO_GIB / sizeof(wchar_t)}) {
+        checkTooLong(L'x', count, [](wchar_t const* s) { Koru::make_wstring(s); });
+        checkTooLong(L'x', count, [](wchar_t const* s) { Koru::make_string(s); });
     }
-    auto const* const s = static_cast<wchar_t const*>(text.memory());
-    CHECK(outcome([&] { Koru::make_wstring(s); }) == "std::bad_alloc");
-    CHECK(outcome([&] { Koru::make_string(s); }) == "std::bad_alloc");
 }
