@@ -8,7 +8,6 @@
 #include <unistd.h>
 
 #include <cstddef>
-#include <cstdint>
 #include <functional>
 #include <new>
 #include <string>

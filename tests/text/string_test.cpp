@@ -55,21 +55,8 @@ RegisterSelf const registerLate("use-strings-at-exit", [](int, char**) {
     return 0;
 });
 
-template <class Char>
-std::basic_string<Char> randomText(Random& random, std::size_t size) {
-    if constexpr (sizeof(Char) == 1)
-        return randomBytes(random, size, false);
-    else
-        return randomUnits(random, size, false);
-}
-
-/// The functions of one width by one name.
 std::string copyOf(char const* s) { return Koru::make_string(s); }
 std::wstring copyOf(wchar_t const* s) { return Koru::make_wstring(s); }
-std::wstring convertedOf(char const* s) { return Koru::make_wstring(s); }
-std::string convertedOf(wchar_t const* s) { return Koru::make_string(s); }
-std::wstring modelOf(std::string const& s) { return modelDecode(s); }
-std::string modelOf(std::wstring const& s) { return modelEncode(s); }
 
 template <class Char>
 std::string lowBytes(std::basic_string<Char> const& text) {
@@ -163,7 +150,7 @@ TEST_CASE_TEMPLATE("the functions read nothing outside the text they are given",
         for (Char* const place : {memory.first<Char>(), memory.last<Char>(size + 1)}) {
             Char const* const s = copyTo(place);
             bool const same = Koru::length(s) == size && copyOf(s) == text &&
-                              convertedOf(s) == expected && Koru::compare(s, end) == 0;
+                              converted(s) == expected && Koru::compare(s, end) == 0;
             differences.note(same, [&] { return hex(text); });
         }
     }
@@ -190,7 +177,7 @@ TEST_CASE("make_string of narrow text copies its bytes, valid UTF-8 or not, up t
     CHECK(Koru::make_string("ab\0c") == "ab");
     CHECK(hex(Koru::make_string("\xC3\x80\xFF\xFEz")) == "C3 80 FF FE 7A");
     Random random(9);
-    std::string const text = randomBytes(random, 100000, false);
+    std::string const text = randomText<char>(random, 100000);
     CHECK((Koru::make_string(text.c_str()) == text));
 }
 
@@ -200,7 +187,7 @@ TEST_CASE("make_wstring of wide text copies its characters, whatever they are, u
     std::wstring const odd = units({0xFFFFFFFFU, 0xD800, 0x80000000U, 0x7FFFFFFF, 0x100, 0xDC00});
     CHECK(hex(Koru::make_wstring(odd.c_str())) == hex(odd));
     Random random(9);
-    std::wstring const text = randomUnits(random, 100000, false);
+    std::wstring const text = randomText<wchar_t>(random, 100000);
     CHECK((Koru::make_wstring(text.c_str()) == text));
 }
 
@@ -260,7 +247,7 @@ TEST_CASE_TEMPLATE("the string functions may be called from several threads at o
                 std::basic_string<Char> const text = randomText<Char>(random, size);
                 std::ostringstream out;
                 Koru::operator<<(out, text.substr(0, 127));
-                bool const same = convertedOf(text.c_str()) == modelOf(text) &&
+                bool const same = converted(text.c_str()) == modelOf(text) &&
                                   copyOf(text.c_str()) == text && Koru::compare(text, text) == 0 &&
                                   Koru::compare(text, text + Char('x')) < 0 &&
                                   out.str() == lowBytes(text.substr(0, 127));

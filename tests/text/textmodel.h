@@ -3,12 +3,13 @@
 #ifndef KORU_TESTS_TEXTMODEL_H
 #define KORU_TESTS_TEXTMODEL_H
 
+#include <koru/string.h>
+
 #include <sys/mman.h>
 #include <unistd.h>
 
 #include <cstddef>
 #include <cstdint>
-#include <cstring>
 #include <sstream>
 #include <stdexcept>
 #include <string>
@@ -50,7 +51,7 @@ std::basic_string<Char> untilNul(std::basic_string<Char> const& text) {
 }
 
 /// Wide to UTF-8: one to six bytes by the size of the signed value.
-inline std::string modelEncode(std::wstring const& text) {
+inline std::string modelOf(std::wstring const& text) {
     std::string out;
     for (wchar_t const c : untilNul(text)) {
         unsigned tails = 0; // bytes after the lead
@@ -64,7 +65,7 @@ inline std::string modelEncode(std::wstring const& text) {
 
 /// UTF-8 to wide. The forms are tried in this order; each one's last byte has to exist, and the
 /// last form takes any lead.
-inline std::wstring modelDecode(std::string const& text) {
+inline std::wstring modelOf(std::string const& text) {
     struct Form {
         std::size_t size;
         std::uint32_t mask, pattern, leadBits;
@@ -91,8 +92,18 @@ inline std::wstring modelDecode(std::string const& text) {
     return untilNul(out);
 }
 
+/// The conversion of either width.
+inline std::wstring converted(std::string const& text) { return Koru::make_wstring(text); }
+inline std::wstring converted(char const* text) { return Koru::make_wstring(text); }
+inline std::string converted(std::wstring const& text) { return Koru::make_string(text); }
+inline std::string converted(wchar_t const* text) { return Koru::make_string(text); }
+
+template <class Char>
+std::basic_string<Char> randomText(Random& random, std::size_t size, bool withNuls = false);
+
 /// ASCII runs, whole and broken characters, bytes that are neither, and NULs if wanted.
-inline std::string randomBytes(Random& random, std::size_t size, bool withNuls) {
+template <>
+inline std::string randomText(Random& random, std::size_t size, bool withNuls) {
     std::string text;
     auto const run = [&](std::uint32_t sizes, std::uint32_t least, std::uint32_t count) {
         for (auto n = random.below(sizes); n > 0; --n) text += byte(least + random.below(count));
@@ -101,7 +112,7 @@ inline std::string randomBytes(Random& random, std::size_t size, bool withNuls) 
         std::uint32_t const kind = random.below(withNuls ? 8 : 7);
         if (kind < 2) run(40, 1, 127);
         if (kind == 2 || kind == 3) {
-            text += modelEncode(units({1 + (random.next() >> random.below(32))}));
+            text += modelOf(units({1 + (random.next() >> random.below(32))}));
         }
         if (kind == 4) run(9, 0x80, 64);
         if (kind == 5) run(3, 0xC0, 64);
@@ -113,7 +124,8 @@ inline std::string randomBytes(Random& random, std::size_t size, bool withNuls) 
 }
 
 /// Runs of ASCII, of characters of each form and of negative ones, and what ends a text if wanted.
-inline std::wstring randomUnits(Random& random, std::size_t size, bool withNuls) {
+template <>
+inline std::wstring randomText(Random& random, std::size_t size, bool withNuls) {
     std::wstring text;
     while (text.size() < size) {
         std::uint32_t const kind = random.below(withNuls ? 6 : 5);

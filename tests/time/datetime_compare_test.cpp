@@ -4,6 +4,7 @@
 
 #include <doctest/doctest.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <ctime>
 #include <functional>

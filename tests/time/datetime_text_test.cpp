@@ -4,6 +4,8 @@
 #include <doctest/doctest.h>
 
 #include <algorithm>
+#include <cstddef>
+#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <iomanip>
@@ -230,7 +232,7 @@ TEST_CASE("a text that ends early fails where a separator is missing, and else h
 }
 
 TEST_CASE("any text is read as the model reads it") {
-    static char const characters[] = "00112233459:::---- +x\t.";
+    static char const characters[] = "00112233459:::----/ +x\t.";
     static char const* const patterns[] = {
         "2005-03-17 19:45:58", "2005-03-17",          "19:45:58",
         "0000-00-00 00:00:00", "00:0-:1-05 12:34:56", "01:02:03 xx12:34:56"};

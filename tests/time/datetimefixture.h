@@ -8,6 +8,7 @@
 #include <dlfcn.h>
 #include <stdlib.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
