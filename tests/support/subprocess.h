@@ -72,6 +72,18 @@ std::string toldByChild(Callable callable) {
     return outcome.out;
 }
 
+/// How a child ends that runs the callable: "exit 0", say, or "signal 14", which is that of its
+/// alarm: it ends a child that hangs.
+template <class Callable>
+std::string ending(Callable callable) {
+    Outcome const outcome = inChild([&] {
+        ::alarm(120);
+        return static_cast<int>(callable());
+    });
+    return outcome.signal != 0 ? "signal " + std::to_string(outcome.signal)
+                               : "exit " + std::to_string(outcome.exitCode);
+}
+
 /// Runs a program by exec. `arguments` begins with argv[0], which may differ from `program`; the
 /// child changes to `directory` first, unless that is empty.
 inline Outcome execute(std::string const& program, std::vector<std::string> arguments,
