@@ -33,26 +33,20 @@ template <class Object, class Mode>
 struct OpensWith<Object, Mode, decltype(std::declval<Object&>().open(std::declval<Mode>()), void())>
     : std::true_type {};
 
-template <class Object>
-std::wstring nameOf(Object const& object) {
-    return object.getName();
-}
-
 } // namespace
 
-TEST_CASE("a path converts to the file that is there, a name to a file, a flag to an event") {
+TEST_CASE_TEMPLATE("a path converts to the file that is there", Object, DataFile,
+                   InitializationFile, PropertyFile, LogFile) {
+    static_assert(std::is_convertible<File::Path, Object>::value, "");
+    auto const nameOf = [](Object const& object) { return object.getName(); };
+    CHECK(nameOf(File::Path("/folder/name")) == L"/folder/name");
+}
+
+TEST_CASE("a name converts to a file, a flag to an event") {
     static_assert(std::is_convertible<std::wstring, File>::value, "");
-    static_assert(std::is_convertible<File::Path, DataFile>::value, "");
-    static_assert(std::is_convertible<File::Path, InitializationFile>::value, "");
-    static_assert(std::is_convertible<File::Path, PropertyFile>::value, "");
-    static_assert(std::is_convertible<File::Path, LogFile>::value, "");
     static_assert(std::is_convertible<bool, Koru::Event>::value, "");
-    File::Path const path("/folder/name");
-    CHECK(nameOf<InitializationFile>(path) == L"/folder/name");
-    CHECK(nameOf<PropertyFile>(path) == L"/folder/name");
-    CHECK(nameOf<DataFile>(path) == L"/folder/name");
-    CHECK(nameOf<LogFile>(path) == L"/folder/name");
-    CHECK(nameOf<File>(std::wstring(L"name")) == L"name");
+    auto const nameOf = [](File const& file) { return file.getName(); };
+    CHECK(nameOf(std::wstring(L"name")) == L"name");
 }
 
 TEST_CASE_TEMPLATE("the open modes of a stream do not pass for a file's modes", Object, File,
@@ -60,16 +54,13 @@ TEST_CASE_TEMPLATE("the open modes of a stream do not pass for a file's modes", 
     static_assert(!OpensWith<Object, std::ios_base::openmode>::value, "");
     static_assert(!OpensWith<Object, decltype(std::ios::in | std::ios::out)>::value, "");
     static_assert(OpensWith<Object, unsigned long>::value, "");
-    static_assert(OpensWith<Object, unsigned int>::value, "");
-    static_assert(OpensWith<Object, int>::value, "");
+    static_assert(OpensWith<Object, unsigned int>::value && OpensWith<Object, int>::value, "");
     static_assert(OpensWith<Object, decltype(File::READ)>::value, "");
-    CHECK(true); // it compiles
 }
 
 TEST_CASE("a log keeps the one signature that it has") {
     static_assert(std::is_same<decltype(&LogFile::open), void (LogFile::*)(unsigned int)>::value,
                   "");
-    CHECK(true); // it compiles
 }
 
 TEST_CASE("the mode is an unsigned long in place and size") {

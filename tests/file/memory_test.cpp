@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <cstddef>
-#include <cstdio>
 #include <string>
 
 #include <koru/logfile.h>
@@ -68,7 +67,6 @@ TEST_CASE("a file that runs out of memory while it is opened is closed and keeps
 }
 
 TEST_CASE_TEMPLATE("lines read before memory runs out are held", Family, Sectioned, Flat) {
-    CAPTURE(Family::label());
     TempDir const directory;
     std::string const path = directory / "file";
     int const count = 5000;
@@ -94,11 +92,8 @@ std::size_t const LARGE = 190 * 1024 * 1024;
 
 /// What the process takes of its address space, in bytes.
 std::size_t _addressSpace() {
-    std::size_t pages = 0;
-    std::FILE* const file = std::fopen("/proc/self/statm", "r");
-    bool const read = file != nullptr && std::fscanf(file, "%zu", &pages) == 1;
-    if (file != nullptr) std::fclose(file);
-    return read ? pages * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE)) : 0;
+    return std::stoul(readFile("/proc/self/statm")) *
+           static_cast<std::size_t>(::sysconf(_SC_PAGESIZE));
 }
 
 } // namespace
@@ -106,20 +101,17 @@ std::size_t _addressSpace() {
 TEST_CASE_TEMPLATE("a large file of comments takes its own size and no room for entries" *
                        doctest::skip(!test::ADDRESS_SPACE_CAN_BE_LIMITED),
                    Family, Sectioned, Flat) {
-    CAPTURE(Family::label());
     TempDir const directory;
     std::string const path = directory / "file";
     writeFile(path, Family::bytes(0, 2) + "#");
     // The rest of the comment is a hole, which takes no place on the disk.
     REQUIRE(::truncate(path.c_str(), static_cast<off_t>(LARGE)) == 0);
-    test::Outcome const outcome = test::inChild([&] {
-        std::size_t const most = _addressSpace() + LARGE + LARGE / 8;
-        rlimit const limit = {most, most};
-        if (::setrlimit(RLIMIT_AS, &limit) != 0) return 1;
-        typename Family::File file(path);
-        file.open(File::READ);
-        return test::sizeOf<Family>(file) == 2 ? 0 : 2;
-    });
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == 0);
+    CHECK(test::ending([&] {
+              std::size_t const most = _addressSpace() + LARGE + LARGE / 8;
+              rlimit const limit = {most, most};
+              if (::setrlimit(RLIMIT_AS, &limit) != 0) return 1;
+              typename Family::File file(path);
+              file.open(File::READ);
+              return test::sizeOf<Family>(file) == 2 ? 0 : 2;
+          }) == "exit 0");
 }
