@@ -13,7 +13,6 @@
 
 #include <atomic>
 #include <chrono>
-#include <ctime>
 #include <fstream>
 #include <functional>
 #include <limits>
@@ -21,15 +20,19 @@
 #include <string>
 #include <thread>
 #include <type_traits>
+#include <utility>
 #include <vector>
 
+#include "support/cancellation.h"
+#include "support/script.h"
 #include "support/subprocess.h"
 
 namespace {
 
-using Clock = std::chrono::steady_clock;
+bool clockFails = false;
 
-/// What the timed wait of the C library is asked for, and what it shall answer instead of waiting.
+/// What the timed wait of the C library is asked for in a thread, and what it shall answer there
+/// instead of waiting.
 struct TimedWait {
     static int const WAITS = -1;
     int answer = WAITS;
@@ -42,13 +45,8 @@ thread_local TimedWait timedWait;
 
 } // namespace
 
-// Stands before the C library's function, so that tests see the deadline and make the wait fail.
-namespace {
-
-bool clockFails = false;
-
-} // namespace
-
+// These come before the C library's functions, so that tests see the deadline and let the wait
+// fail.
 extern "C" int gettimeofday(timeval* now, void* zone) noexcept {
     if (!clockFails) return static_cast<int>(::syscall(SYS_gettimeofday, now, zone));
     errno = EOVERFLOW;
@@ -67,7 +65,23 @@ extern "C" int pthread_cond_timedwait(pthread_cond_t* condition, pthread_mutex_t
 
 namespace {
 
-std::time_t const LAST_SECOND = std::numeric_limits<std::time_t>::max();
+using Clock = std::chrono::steady_clock;
+using Koru::Event;
+
+time_t const LAST_SECOND = std::numeric_limits<time_t>::max();
+
+/// How the timed wait was called by a wait that it answered.
+struct Answered : TimedWait {
+    Answered(Event& event, unsigned long timeout, int with,
+             std::function<void()> const& before = {}) {
+        timedWait = TimedWait();
+        timedWait.answer = with;
+        timedWait.meanwhile = before;
+        result = event.wait(timeout);
+        static_cast<TimedWait&>(*this) = std::exchange(timedWait, TimedWait());
+    }
+    int result = 99;
+};
 
 /// True if the thread sleeps in the kernel.
 bool sleeps(long threadId) {
@@ -78,26 +92,18 @@ bool sleeps(long threadId) {
     return state != std::string::npos && line[state + 2] == 'S';
 }
 
-/// A thread that waits for an event.
+/// A thread that waits for an event. It has gone to sleep there when it has been made.
 class Waiter {
 public:
-    Waiter(Koru::Event& event, unsigned long timeout)
+    Waiter(Event& event, unsigned long timeout)
         : Waiter([&event, timeout] { return event.wait(timeout); }) {}
-    explicit Waiter(Koru::Event& event) : Waiter([&event] { return event.wait(); }) {}
+    explicit Waiter(Event& event) : Waiter([&event] { return event.wait(); }) {}
     Waiter(Waiter const&) = delete;
     Waiter& operator=(Waiter const&) = delete;
     ~Waiter() {
         if (thread_.joinable()) thread_.join();
     }
 
-    /// Returns when the thread has gone to sleep in its wait.
-    void untilItWaits() const {
-        while (threadId_ == 0) ::usleep(1000);
-        for (int inARow = 0; inARow < 20 && !returned_;) {
-            inARow = sleeps(threadId_) ? inARow + 1 : 0;
-            ::usleep(2000);
-        }
-    }
     bool returned() const { return returned_; }
     int result() {
         thread_.join();
@@ -111,7 +117,13 @@ private:
               threadId_ = ::syscall(SYS_gettid);
               result_ = wait();
               returned_ = true;
-          }) {}
+          }) {
+        while (threadId_ == 0) ::usleep(1000);
+        for (int inARow = 0; inARow < 20 && !returned_;) {
+            inARow = sleeps(threadId_) ? inARow + 1 : 0;
+            ::usleep(2000);
+        }
+    }
 
     std::atomic<long> threadId_{0};
     std::atomic<bool> returned_{false};
@@ -119,23 +131,45 @@ private:
     std::thread thread_;
 };
 
+/// Whether a waiter stays that long and is then woken by a signal, with 0.
+bool waitsForSignal(Event& event, Waiter& waiter, useconds_t microseconds) {
+    ::usleep(microseconds);
+    bool const waits = !waiter.returned();
+    event.signal();
+    return waits && waiter.result() == 0;
+}
+
 /// Whether signal, test, reset and a short wait still work, which all need the event's mutex.
-bool usable(Koru::Event& event) {
+bool usable(Event& event) {
     event.signal();
     if (!event.test()) return false;
     event.reset();
     return !event.test() && event.wait(0) == 1;
 }
 
+using AutoReset = std::true_type;
+using ManualReset = std::false_type;
+
+test::Words<Event> const WORDS = {
+    {"signal", [](Event& event) { event.signal(); }},
+    {"reset", [](Event& event) { event.reset(); }},
+    {"raised", [](Event& event) { CHECK(event.test()); }},
+    {"lowered", [](Event& event) { CHECK_FALSE(event.test()); }},
+};
+
+template <class Reset>
+void follow(std::string const& script) {
+    Event event(Reset::value);
+    test::follow(event, WORDS, script);
+}
+
 } // namespace
 
-// ========================================================================================= shape
-
 TEST_CASE("an event is made from a choice, cannot be copied and has a virtual destructor") {
-    CHECK(std::is_constructible<Koru::Event, bool>::value);
-    CHECK(!std::is_copy_constructible<Koru::Event>::value);
-    CHECK(!std::is_copy_assignable<Koru::Event>::value);
-    CHECK(std::has_virtual_destructor<Koru::Event>::value);
+    CHECK(std::is_constructible<Event, bool>::value);
+    CHECK(!std::is_copy_constructible<Event>::value);
+    CHECK(!std::is_copy_assignable<Event>::value);
+    CHECK(std::has_virtual_destructor<Event>::value);
 }
 
 TEST_CASE("an event holds a mutex, a condition and two flags besides its virtual table") {
@@ -143,97 +177,58 @@ TEST_CASE("an event holds a mutex, a condition and two flags besides its virtual
         void* virtualTable;
         pthread_mutex_t mutex;
         pthread_cond_t condition;
-        bool autoReset;
-        bool signalled;
+        bool autoReset, signalled;
     };
-    CHECK(sizeof(Koru::Event) == sizeof(Members));
+    CHECK(sizeof(Event) == sizeof(Members));
 }
 
 TEST_CASE("a derived object is destroyed through a pointer to its event") {
-    struct Derived : Koru::Event {
-        explicit Derived(bool& flag) : Koru::Event(true), destroyed(flag) {}
+    struct Derived : Event {
+        explicit Derived(bool& flag) : Event(true), destroyed(flag) {}
         ~Derived() override { destroyed = true; }
         bool& destroyed;
     };
     bool destroyed = false;
-    std::unique_ptr<Koru::Event> event(new Derived(destroyed));
+    std::unique_ptr<Event> event = std::make_unique<Derived>(destroyed);
     event->signal();
     CHECK(event->test());
     event.reset();
     CHECK(destroyed);
 }
 
-// ====================================================================================== the flag
+// ---- The flag
 
-TEST_CASE("a new event is not signalled") {
-    for (bool const autoReset : {true, false}) {
-        CAPTURE(autoReset);
-        Koru::Event event(autoReset);
-        CHECK_FALSE(event.test());
-        CHECK_FALSE(event.test());
-    }
+TEST_CASE_TEMPLATE("a new event is not signalled", Reset, AutoReset, ManualReset) {
+    follow<Reset>("lowered lowered");
 }
 
 TEST_CASE("test of an auto-reset event is true once for a signal") {
-    Koru::Event event(true);
-    for (int i = 0; i < 3; ++i) {
-        event.signal();
-        CHECK(event.test());
-        CHECK_FALSE(event.test());
-        CHECK_FALSE(event.test());
-    }
+    follow<AutoReset>("signal raised lowered lowered signal raised lowered lowered");
 }
 
 TEST_CASE("test of a manual-reset event is true until reset") {
-    Koru::Event event(false);
-    for (int i = 0; i < 3; ++i) {
-        event.signal();
-        for (int again = 0; again < 5; ++again) CHECK(event.test());
-        event.reset();
-        CHECK_FALSE(event.test());
-        CHECK_FALSE(event.test());
-    }
+    follow<ManualReset>("signal raised raised raised reset lowered lowered signal raised raised");
 }
 
 TEST_CASE("signals are not counted") {
-    Koru::Event autoReset(true);
-    Koru::Event manualReset(false);
-    for (int i = 0; i < 3; ++i) {
-        autoReset.signal();
-        manualReset.signal();
-    }
-    CHECK(autoReset.test());
-    CHECK_FALSE(autoReset.test());
-    CHECK(manualReset.test());
-    manualReset.reset();
-    CHECK_FALSE(manualReset.test());
+    follow<AutoReset>("signal signal signal raised lowered");
+    follow<ManualReset>("signal signal signal raised reset lowered");
 }
 
-TEST_CASE("reset takes a signal back, and may come without one") {
-    for (bool const autoReset : {true, false}) {
-        CAPTURE(autoReset);
-        Koru::Event event(autoReset);
-        event.reset();
-        CHECK_FALSE(event.test());
-        event.signal();
-        event.reset();
-        event.reset();
-        CHECK_FALSE(event.test());
-        event.signal();
-        CHECK(event.test());
-    }
+TEST_CASE_TEMPLATE("reset takes a signal back, and may come without one", Reset, AutoReset,
+                   ManualReset) {
+    follow<Reset>("reset lowered signal reset reset lowered signal raised");
 }
 
 TEST_CASE("two events are independent") {
-    Koru::Event first(true);
-    Koru::Event second(true);
-    first.signal();
-    CHECK_FALSE(second.test());
-    CHECK(first.test());
+    Event first(true), second(true);
+    test::follow(first, WORDS, "signal");
+    test::follow(second, WORDS, "lowered");
+    test::follow(first, WORDS, "raised");
 }
 
 TEST_CASE("each signal of an auto-reset event is seen by exactly one of the testing threads") {
-    Koru::Event event(true);
+    Event event(true);
     int const SIGNALS = 300;
     std::atomic<int> seen{0};
     std::atomic<bool> stop{false};
@@ -256,54 +251,47 @@ TEST_CASE("each signal of an auto-reset event is seen by exactly one of the test
     CHECK(seen == SIGNALS);
 }
 
-// ======================================================================================= waiting
+// ---- Waiting
 
 TEST_CASE("a wait of 0 seconds returns 1 when nobody signals") {
-    Koru::Event event(true);
+    Event event(true);
     for (int i = 0; i < 10; ++i) CHECK(event.wait(0) == 1);
     CHECK(usable(event));
 }
 
 TEST_CASE("a wait counts whole seconds and returns 1 when they have passed") {
-    Koru::Event event(true);
+    Event event(true);
     Clock::time_point const start = Clock::now();
     CHECK(event.wait(1) == 1);
     CHECK((Clock::now() - start >= std::chrono::milliseconds(990)));
     CHECK(usable(event));
 }
 
-TEST_CASE("a signal that came before a wait does not end it, and the wait does not see the flag") {
-    for (bool const autoReset : {true, false}) {
-        CAPTURE(autoReset);
-        Koru::Event event(autoReset);
-        event.signal();
-        Clock::time_point const start = Clock::now();
-        CHECK(event.wait(1) == 1);
-        CHECK((Clock::now() - start >= std::chrono::milliseconds(990)));
-        CHECK(event.test());
-        CHECK(event.test() == !autoReset);
-    }
+TEST_CASE_TEMPLATE("a signal that came before a wait does not end it, and the wait does not see "
+                   "the flag",
+                   Reset, AutoReset, ManualReset) {
+    Event event(Reset::value);
+    event.signal();
+    Clock::time_point const start = Clock::now();
+    CHECK(event.wait(1) == 1);
+    CHECK((Clock::now() - start >= std::chrono::milliseconds(990)));
+    CHECK(event.test());
+    CHECK(event.test() == !Reset::value);
 }
 
-TEST_CASE("a signal ends a wait with 0 and leaves the flag raised") {
-    for (bool const autoReset : {true, false}) {
-        CAPTURE(autoReset);
-        Koru::Event event(autoReset);
-        Waiter waiter(event, 600);
-        waiter.untilItWaits();
-        CHECK_FALSE(waiter.returned());
-        CHECK_FALSE(event.test());
-        event.signal();
-        CHECK(waiter.result() == 0);
-        CHECK(event.test());
-        CHECK(event.test() == !autoReset);
-    }
+TEST_CASE_TEMPLATE("a signal ends a wait with 0 and leaves the flag raised", Reset, AutoReset,
+                   ManualReset) {
+    Event event(Reset::value);
+    Waiter waiter(event, 600);
+    CHECK_FALSE(event.test());
+    CHECK(waitsForSignal(event, waiter, 0));
+    CHECK(event.test());
+    CHECK(event.test() == !Reset::value);
 }
 
 TEST_CASE("a wait ends with 0 even if the flag is lowered before the waiting thread runs again") {
-    Koru::Event event(false);
+    Event event(false);
     Waiter waiter(event, 600);
-    waiter.untilItWaits();
     event.signal();
     event.reset();
     CHECK(waiter.result() == 0);
@@ -311,26 +299,17 @@ TEST_CASE("a wait ends with 0 even if the flag is lowered before the waiting thr
 }
 
 TEST_CASE("test and reset do not end a wait") {
-    Koru::Event event(true);
+    Event event(true);
     event.signal();
     Waiter waiter(event, 600);
-    waiter.untilItWaits();
     CHECK(event.test());
     event.reset();
-    ::usleep(100000);
-    CHECK_FALSE(waiter.returned());
-    event.signal();
-    CHECK(waiter.result() == 0);
+    CHECK(waitsForSignal(event, waiter, 100000));
 }
 
 TEST_CASE("a signal wakes one waiting thread and leaves the others waiting") {
-    Koru::Event event(true);
-    Waiter first(event, 600);
-    Waiter second(event, 600);
-    Waiter third(event, 600);
-    first.untilItWaits();
-    second.untilItWaits();
-    third.untilItWaits();
+    Event event(true);
+    Waiter first(event, 600), second(event, 600), third(event, 600);
     auto const returned = [&] {
         return int(first.returned()) + int(second.returned()) + int(third.returned());
     };
@@ -340,34 +319,24 @@ TEST_CASE("a signal wakes one waiting thread and leaves the others waiting") {
         ::usleep(100000);
         CHECK(returned() == signals);
     }
-    CHECK(first.result() == 0);
-    CHECK(second.result() == 0);
-    CHECK(third.result() == 0);
+    for (Waiter* const waiter : {&first, &second, &third}) CHECK(waiter->result() == 0);
 }
 
 TEST_CASE("a wait without limit lasts until a signal that comes during it") {
     for (unsigned long const timeout : {0xFFFFFFFFUL, ULONG_MAX}) {
         CAPTURE(timeout);
-        Koru::Event event(true);
+        Event event(true);
         event.signal();
         Waiter waiter(event, timeout);
-        waiter.untilItWaits();
-        ::usleep(200000);
-        CHECK_FALSE(waiter.returned());
-        event.signal();
-        CHECK(waiter.result() == 0);
+        CHECK(waitsForSignal(event, waiter, 200000));
         CHECK(event.test());
     }
 }
 
 TEST_CASE("without an argument wait has no limit") {
-    Koru::Event event(true);
+    Event event(true);
     Waiter waiter(event);
-    waiter.untilItWaits();
-    ::usleep(200000);
-    CHECK_FALSE(waiter.returned());
-    event.signal();
-    CHECK(waiter.result() == 0);
+    CHECK(waitsForSignal(event, waiter, 200000));
 }
 
 TEST_CASE("a wait with a deadline beyond what time_t counts waits and can be signalled") {
@@ -375,18 +344,14 @@ TEST_CASE("a wait with a deadline beyond what time_t counts waits and can be sig
          {0x7FFFFFFEUL, 0x7FFFFFFFUL, 0x80000000UL, 4294967294UL, ULONG_MAX / 2 - 1, ULONG_MAX / 2,
           ULONG_MAX / 2 + 1, ULONG_MAX - 1}) {
         CAPTURE(timeout);
-        Koru::Event event(true);
+        Event event(true);
         Waiter waiter(event, timeout);
-        waiter.untilItWaits();
-        ::usleep(150000);
-        CHECK_FALSE(waiter.returned());
-        event.signal();
-        CHECK(waiter.result() == 0);
+        CHECK(waitsForSignal(event, waiter, 150000));
     }
 }
 
 TEST_CASE("the loop that tests before it waits misses no signal") {
-    Koru::Event event(true);
+    Event event(true);
     int const SIGNALS = 20;
     std::atomic<int> seen{0};
     std::thread consumer([&] {
@@ -404,154 +369,139 @@ TEST_CASE("the loop that tests before it waits misses no signal") {
     CHECK_FALSE(event.test());
 }
 
-// ========================================================== the timed wait of the C library
+// ---- The timed wait of the C library
 
 TEST_CASE("the deadline is the present time in microseconds and the seconds of the time-out") {
-    Koru::Event event(true);
+    Event event(true);
+    auto const now = [] {
+        timeval time = {};
+        ::gettimeofday(&time, nullptr);
+        return time.tv_sec * 1000000LL + time.tv_usec;
+    };
     for (unsigned long const timeout : {0UL, 1UL, 5UL, 3600UL, 86400UL * 365}) {
         CAPTURE(timeout);
-        timedWait = TimedWait();
-        timedWait.answer = ETIMEDOUT;
-        timeval before = {};
-        timeval after = {};
-        ::gettimeofday(&before, nullptr);
-        CHECK(event.wait(timeout) == 1);
-        ::gettimeofday(&after, nullptr);
-        TimedWait const seen = timedWait;
-        timedWait = TimedWait();
+        long long const before = now();
+        Answered const seen(event, timeout, ETIMEDOUT);
+        long long const after = now();
+        CHECK(seen.result == 1);
         CHECK(seen.calls == 1);
         CHECK(seen.mutexHeld);
         CHECK(seen.deadline.tv_nsec % 1000 == 0);
-        auto const microseconds = [](std::time_t seconds, long rest) {
-            return static_cast<long long>(seconds) * 1000000 + rest;
-        };
-        long long const deadline =
-            microseconds(seen.deadline.tv_sec, seen.deadline.tv_nsec / 1000) -
-            static_cast<long long>(timeout) * 1000000;
-        CHECK(deadline >= microseconds(before.tv_sec, before.tv_usec));
-        CHECK(deadline <= microseconds(after.tv_sec, after.tv_usec));
         CHECK(seen.deadline.tv_nsec >= 0);
         CHECK(seen.deadline.tv_nsec < 1000000000);
+        long long const start =
+            (seen.deadline.tv_sec - static_cast<long long>(timeout)) * 1000000LL +
+            seen.deadline.tv_nsec / 1000;
+        CHECK(start >= before);
+        CHECK(start <= after);
     }
 }
 
 TEST_CASE("a deadline that does not fit time_t becomes the last second that does") {
-    Koru::Event event(true);
+    Event event(true);
     auto const room = static_cast<unsigned long>(LAST_SECOND - ::time(nullptr));
     for (unsigned long const timeout :
          {room + 10, static_cast<unsigned long>(LAST_SECOND),
           static_cast<unsigned long>(LAST_SECOND) + 1, ULONG_MAX - 1}) {
         CAPTURE(timeout);
-        timedWait = TimedWait();
-        timedWait.answer = ETIMEDOUT;
-        CHECK(event.wait(timeout) == 1);
-        CHECK(timedWait.calls == 1);
-        CHECK(timedWait.deadline.tv_sec == LAST_SECOND);
-        CHECK(timedWait.deadline.tv_nsec >= 0);
-        CHECK(timedWait.deadline.tv_nsec < 1000000000);
-        timedWait = TimedWait();
+        Answered const seen(event, timeout, ETIMEDOUT);
+        CHECK(seen.result == 1);
+        CHECK(seen.calls == 1);
+        CHECK(seen.deadline.tv_sec == LAST_SECOND);
+        CHECK(seen.deadline.tv_nsec >= 0);
+        CHECK(seen.deadline.tv_nsec < 1000000000);
     }
 }
 
 TEST_CASE("a wait fails where the present does not fit a timeval, as on 32 bits after 2038") {
-    Koru::Event event(true);
+    Event event(true);
     event.signal();
     clockFails = true;
-    timedWait = TimedWait();
-    int const result = event.wait(1);
+    Answered const seen(event, 1, TimedWait::WAITS);
     clockFails = false;
-    CHECK(result == -1);
-    CHECK(timedWait.calls == 0);
+    CHECK(seen.result == -1);
+    CHECK(seen.calls == 0);
     CHECK(event.test()); // the event is as it was, its mutex free
 }
 
 TEST_CASE("a deadline that just fits time_t is kept") {
-    Koru::Event event(true);
+    Event event(true);
     auto const room = static_cast<unsigned long>(LAST_SECOND - ::time(nullptr));
-    timedWait.answer = ETIMEDOUT;
-    CHECK(event.wait(room - 1000) == 1);
-    CHECK(timedWait.deadline.tv_sec <= LAST_SECOND - 900);
-    CHECK(timedWait.deadline.tv_sec >= LAST_SECOND - 1000);
-    timedWait = TimedWait();
+    Answered const seen(event, room - 1000, ETIMEDOUT);
+    CHECK(seen.result == 1);
+    CHECK(seen.deadline.tv_sec <= LAST_SECOND - 900);
+    CHECK(seen.deadline.tv_sec >= LAST_SECOND - 1000);
 }
 
 TEST_CASE("time-outs of more than 32 bits are neither cut nor taken as without limit" *
           doctest::skip(sizeof(unsigned long) == 4)) {
-    Koru::Event event(true);
+    Event event(true);
     for (unsigned long long const timeout :
          {0x100000000ULL, 0x100000005ULL, 0x1FFFFFFFFULL, 0xFFFFFFFF00000000ULL}) {
         CAPTURE(timeout);
-        timedWait = TimedWait();
-        timedWait.answer = ETIMEDOUT;
-        CHECK(event.wait(static_cast<unsigned long>(timeout)) == 1);
-        CHECK(timedWait.calls == 1);
-        CHECK(static_cast<unsigned long long>(timedWait.deadline.tv_sec) > 0x100000000ULL);
-        timedWait = TimedWait();
+        Answered const seen(event, static_cast<unsigned long>(timeout), ETIMEDOUT);
+        CHECK(seen.result == 1);
+        CHECK(seen.calls == 1);
+        CHECK(static_cast<unsigned long long>(seen.deadline.tv_sec) > 0x100000000ULL);
     }
 }
 
 TEST_CASE("a wait returns 0 when woken, 1 when time ran out, -1 for every other failure") {
-    struct Row {
-        int answer;
-        int expected;
-    };
-    Row const rows[] = {{0, 0},       {ETIMEDOUT, 1}, {EINVAL, -1},    {EPERM, -1},
-                        {ENOMEM, -1}, {EINTR, -1},    {EOVERFLOW, -1}, {ENOTRECOVERABLE, -1}};
-    for (Row const& row : rows) {
-        CAPTURE(row.answer);
-        Koru::Event event(true);
+    std::pair<int, int> const rows[] = {{0, 0},          {ETIMEDOUT, 1},       {EINVAL, -1},
+                                        {EPERM, -1},     {ENOMEM, -1},         {EINTR, -1},
+                                        {EOVERFLOW, -1}, {ENOTRECOVERABLE, -1}};
+    for (auto const& [answer, expected] : rows) {
+        CAPTURE(answer);
+        Event event(true);
         event.signal();
-        timedWait.answer = row.answer;
-        int const result = event.wait(5);
-        timedWait = TimedWait();
-        CHECK(result == row.expected);
+        CHECK(Answered(event, 5, answer).result == expected);
         // In a child, since a mutex that stayed locked would stop it.
-        test::Outcome const outcome = test::inChild([&] {
-            ::alarm(60);
-            return event.test() && usable(event) ? 0 : 1;
-        });
-        REQUIRE(outcome.signal == 0);
-        CHECK(outcome.exitCode == 0);
+        REQUIRE(test::ending([&] { return event.test() && usable(event) ? 0 : 1; }) == "exit 0");
         CHECK(event.test());
     }
 }
 
-TEST_CASE("every operation takes the event's mutex") {
-    struct Row {
-        std::string label;
-        void (*operation)(Koru::Event&);
-    };
-    Row const rows[] = {{"signal", [](Koru::Event& event) { event.signal(); }},
-                        {"reset", [](Koru::Event& event) { event.reset(); }},
-                        {"test", [](Koru::Event& event) { event.test(); }},
-                        {"wait", [](Koru::Event& event) { event.wait(0); }}};
-    for (Row const& row : rows) {
-        CAPTURE(row.label);
-        Koru::Event event(true);
-        std::atomic<bool> finished{false};
-        bool early = true;
-        std::thread other;
-        timedWait.answer = ETIMEDOUT;
-        timedWait.meanwhile = [&] {
-            other = std::thread([&] {
-                row.operation(event);
-                finished = true;
-            });
-            ::usleep(50000);
-            early = finished;
-        };
-        CHECK(event.wait(5) == 1);
-        timedWait = TimedWait();
-        other.join();
-        CHECK_FALSE(early);
-        CHECK(finished);
-    }
+namespace {
+
+struct Signal {
+    static void run(Event& event) { event.signal(); }
+};
+struct Reset {
+    static void run(Event& event) { event.reset(); }
+};
+struct Test {
+    static void run(Event& event) { event.test(); }
+};
+struct Wait {
+    static void run(Event& event) { event.wait(0); }
+};
+
+} // namespace
+
+TEST_CASE_TEMPLATE("every operation takes the event's mutex", Operation, Signal, Reset, Test,
+                   Wait) {
+    Event event(true);
+    std::atomic<bool> finished{false};
+    bool early = true;
+    std::thread other;
+    Answered const seen(event, 5, ETIMEDOUT, [&] {
+        other = std::thread([&] {
+            Operation::run(event);
+            finished = true;
+        });
+        ::usleep(50000);
+        early = finished;
+    });
+    CHECK(seen.result == 1);
+    other.join();
+    CHECK_FALSE(early);
+    CHECK(finished);
 }
 
 TEST_CASE("a wait without limit does not use the timed wait") {
     for (unsigned long const timeout : {0xFFFFFFFFUL, ULONG_MAX}) {
         CAPTURE(timeout);
-        Koru::Event event(true);
+        Event event(true);
         int calls = -1;
         std::atomic<bool> returned{false};
         std::thread thread([&] {
@@ -568,96 +518,62 @@ TEST_CASE("a wait without limit does not use the timed wait") {
     }
 }
 
-// ================================================================================== cancellation
+// ---- Cancellation
 
 namespace {
 
-struct Job {
-    Koru::Event& event;
-    unsigned long timeout;
-    bool cancelsItself;
-    std::atomic<long> threadId{0};
-    std::atomic<bool> returned{false};
-    std::atomic<bool> unwound{false};
-
-    struct Unwinds {
-        Job& job;
-        ~Unwinds() { job.unwound = true; }
-    };
-};
-
-void* waitForJob(void* argument) {
-    Job& job = *static_cast<Job*>(argument);
-    Job::Unwinds const unwinds{job};
-    if (job.cancelsItself) ::pthread_cancel(::pthread_self());
-    job.threadId = ::syscall(SYS_gettid);
-    job.event.wait(job.timeout);
-    job.returned = true;
-    return nullptr;
-}
-
 /// 0 when a thread that is cancelled in its wait is unwound and leaves the event usable.
 int cancelledInWait(unsigned long timeout, bool cancelsItself) {
-    ::alarm(60);
-    Koru::Event event(true);
-    Job job{event, timeout, cancelsItself};
-    pthread_t thread;
-    if (::pthread_create(&thread, nullptr, waitForJob, &job) != 0) return 1;
-    if (!cancelsItself) {
-        while (job.threadId == 0 || !sleeps(job.threadId)) ::usleep(1000);
-        ::usleep(50000);
-        ::pthread_cancel(thread);
-    }
-    void* result = nullptr;
-    ::pthread_join(thread, &result);
-    if (result != PTHREAD_CANCELED) return 2;
-    if (!job.unwound || job.returned) return 3;
-    if (!usable(event)) return 4;
+    Event event(true);
+    std::atomic<long> threadId{0};
+    std::atomic<bool> returned{false};
+    bool const cancelled = test::endsCancelled(
+        [&] {
+            if (cancelsItself) ::pthread_cancel(::pthread_self());
+            threadId = ::syscall(SYS_gettid);
+            event.wait(timeout);
+            returned = true;
+        },
+        [&](pthread_t thread) {
+            if (cancelsItself) return;
+            while (threadId == 0 || !sleeps(threadId)) ::usleep(1000);
+            ::usleep(50000);
+            ::pthread_cancel(thread);
+        });
+    if (!cancelled || returned) return 1;
+    if (!usable(event)) return 2;
     bool elsewhere = false;
     std::thread([&] { elsewhere = usable(event); }).join();
-    return elsewhere ? 0 : 5;
+    return elsewhere ? 0 : 3;
 }
 
 } // namespace
 
-// In a child with an alarm: a mutex that stayed locked would stop the whole process.
 TEST_CASE("a thread that is cancelled in its wait is unwound and leaves the event usable") {
     for (bool const cancelsItself : {false, true}) {
         for (unsigned long const timeout : {600UL, 4294967294UL, 0xFFFFFFFFUL, ULONG_MAX}) {
             CAPTURE(cancelsItself);
             CAPTURE(timeout);
-            test::Outcome const outcome =
-                test::inChild([&] { return cancelledInWait(timeout, cancelsItself); });
-            CHECK(outcome.signal == 0);
-            CHECK(outcome.exitCode == 0);
+            CHECK(test::ending([&] { return cancelledInWait(timeout, cancelsItself); }) ==
+                  "exit 0");
         }
     }
 }
 
 TEST_CASE("signal, test and reset are not cancellation points") {
-    test::Outcome const outcome = test::inChild([] {
-        ::alarm(60);
-        struct Pass {
-            Koru::Event event{true};
-            std::atomic<bool> reached{false};
-        } pass;
-        pthread_t thread;
-        auto const body = [](void* argument) -> void* {
-            Pass& own = *static_cast<Pass*>(argument);
-            ::pthread_cancel(::pthread_self());
-            own.event.signal();
-            bool const seen = own.event.test();
-            own.event.reset();
-            own.reached = seen;
-            ::pthread_testcancel();
-            return nullptr;
-        };
-        if (::pthread_create(&thread, nullptr, body, &pass) != 0) return 1;
-        void* result = nullptr;
-        ::pthread_join(thread, &result);
-        if (result != PTHREAD_CANCELED) return 2;
-        return pass.reached && usable(pass.event) ? 0 : 3;
-    });
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == 0);
+    CHECK(test::ending([] {
+              Event event(true);
+              std::atomic<bool> reached{false};
+              bool const cancelled = test::endsCancelled(
+                  [&] {
+                      ::pthread_cancel(::pthread_self());
+                      event.signal();
+                      bool const seen = event.test();
+                      event.reset();
+                      reached = seen;
+                      ::pthread_testcancel();
+                  },
+                  [](pthread_t) {});
+              return cancelled && reached && usable(event) ? 0 : 1;
+          }) == "exit 0");
 }

@@ -18,7 +18,6 @@
 #include <atomic>
 #include <chrono>
 #include <cstdint>
-#include <cstring>
 #include <filesystem>
 #include <functional>
 #include <iterator>
@@ -33,6 +32,8 @@
 #include <doctest/doctest.h>
 
 #include "support/cancellation.h"
+#include "support/script.h"
+#include "support/slots.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
 
@@ -80,7 +81,7 @@ void note(char const* name, pthread_t handle) {
 
 } // namespace
 
-// Stand before the C library's functions and pass on to them.
+// These come before the C library's functions and pass on to them.
 
 extern "C" NOT_WATCHED int pthread_attr_init(pthread_attr_t* attributes) noexcept {
     if (SystemCalls::current != nullptr) ++SystemCalls::current->attributes;
@@ -178,23 +179,118 @@ void untilThreadsAre(int count) {
     while (threadCount() > count) ::usleep(1000);
 }
 
-/// An object's function in its virtual table.
-template <class Function>
-Function* slot(Koru::Thread const& thread, int number) {
-    void* const* table = nullptr;
-    std::memcpy(&table, static_cast<void const*>(&thread), sizeof table);
-    return reinterpret_cast<Function*>(table[number]);
-}
-
 /// A flag that says that the scope was left.
 struct Witness {
     std::atomic<bool>& left;
     ~Witness() { left = true; }
 };
 
-} // namespace
+/// A thread object that scripts are about, and what it asks of the system.
+struct Subject {
+    SystemCalls calls;
+    Echo echo;
+    int value = 0;
+    int other = 0;
+};
 
-// ========================================================================================= shape
+void checkStart(Subject& s, int detachState) {
+    s.calls.createError = 0;
+    CHECK(s.echo.start(&s.value));
+    CHECK(s.echo.getThreadId() == s.calls.handle);
+    CHECK(s.calls.detachState == detachState);
+}
+
+test::Words<Subject> const WORDS = {
+    {"start", [](Subject& s) { checkStart(s, PTHREAD_CREATE_JOINABLE); }},
+    {"start-detached", [](Subject& s) { checkStart(s, PTHREAD_CREATE_DETACHED); }},
+    {"start-again",
+     [](Subject& s) {
+         unsigned long const id = s.echo.getThreadId();
+         CHECK(s.echo.start(&s.other));
+         CHECK(s.echo.start(nullptr));
+         CHECK(s.echo.getThreadId() == id);
+     }},
+    {"fail",
+     [](Subject& s) {
+         for (int const error : {EAGAIN, EINVAL, EPERM}) {
+             s.calls.createError = error;
+             CHECK(!s.echo.start(&s.other));
+             CHECK(s.calls.attributes == 0);
+         }
+     }},
+    {"join", [](Subject& s) { CHECK(s.echo.join() == &s.value); }},
+    {"join-null", [](Subject& s) { CHECK(s.echo.join() == nullptr); }},
+    {"detach", [](Subject& s) { s.echo.detach(); }},
+    {"abort", [](Subject& s) { s.echo.abort(); }},
+};
+
+/// What a script asks of the system. Only the first start that succeeds counts.
+std::string callsOf(std::string const& script) {
+    int const threads = threadCount();
+    Subject subject;
+    test::follow(subject, WORDS, script);
+    std::string const sequence = subject.calls.sequence;
+    untilThreadsAre(threads);
+    CHECK(subject.calls.attributes == 0);
+    // An aborted one may not have come to it.
+    if (script.find("abort") == std::string::npos) CHECK(subject.echo.runs == 1);
+    CHECK(subject.echo.runs <= 1);
+    CHECK(Koru::ThreadFunction(&subject.echo) == &subject.value); // The argument was kept.
+    return sequence;
+}
+
+// ---- Aborted threads
+
+/// What an aborted thread does, with a flag to raise when it has begun.
+using Body = std::function<void(std::atomic<bool>&)>;
+
+/// Runs the body on a thread that is aborted a while after it has begun, in a process that ends
+/// without destructors: there is no moment at which the last use by the thread is known to be over.
+/// @return 0 when the thread has been unwound and is gone
+int abortedAfter(unsigned int microseconds, Body const& body) {
+    int const threads = threadCount();
+    std::atomic<bool> begun{false};
+    std::atomic<bool> left{false};
+    Work& work = *new Work([&](void*) -> void* {
+        Witness const witness{left};
+        body(begun);
+        for (;;) ::pause(); // Only unwinding leads out.
+    });
+    SystemCalls calls;
+    if (!work.start(nullptr)) return 1;
+    waitFor(begun);
+    ::usleep(microseconds);
+    work.abort();
+    if (work.join() != nullptr) return 2;
+    work.abort();
+    work.detach();
+    if (calls.sequence != "create cancel detach ") return 3;
+    if (calls.handle != work.getThreadId()) return 4;
+    waitFor(left);
+    untilThreadsAre(threads);
+    return 0;
+}
+
+void checkAborted(Body const& body, unsigned int microseconds = 20000) {
+    CHECK(test::ending([&] { return abortedAfter(microseconds, body); }) == "exit 0");
+}
+
+/// The same of a thread that does a step again and again.
+void checkAbortedIn(std::function<void()> const& step) {
+    checkAborted([&](std::atomic<bool>& begun) {
+        begun = true;
+        for (;;) step();
+    });
+}
+
+/// A pipe in a temporary directory.
+struct Pipe {
+    Pipe() { REQUIRE(::mkfifo((directory / "pipe").c_str(), 0600) == 0); }
+    std::wstring name() const { return directory.wide("pipe"); }
+    test::TempDir const directory;
+};
+
+} // namespace
 
 TEST_CASE("a thread object holds two thread ids, the argument and two flags") {
     struct Members {
@@ -221,22 +317,9 @@ TEST_CASE("values and identifiers are those of POSIX threads") {
     CHECK(std::is_same<decltype(&Koru::ThreadFunction), void* (*)(void*)>::value);
 }
 
-TEST_CASE("the virtual functions are stop and run, behind the destructor's two") {
-    class Marked : public Koru::Thread {
-    public:
-        void stop() override { ++stops; }
-        void* run(void* argument) override { return static_cast<char*>(argument) + 1; }
-        int stops = 0;
-    };
-    Marked marked;
-    char bytes[2] = {};
-    slot<void(Koru::Thread*)>(marked, 2)(&marked);
-    CHECK(marked.stops == 1);
-    CHECK(slot<void*(Koru::Thread*, void*)>(marked, 3)(&marked, bytes) == bytes + 1);
-
-    Koru::Thread plain;
-    slot<void(Koru::Thread*)>(plain, 2)(&plain);
-    CHECK(slot<void*(Koru::Thread*, void*)>(plain, 3)(&plain, bytes) == nullptr);
+TEST_CASE("the virtual functions are stop and run, after the destructor's two") {
+    CHECK(test::slotOf(&Koru::Thread::stop) == 2);
+    CHECK(test::slotOf(&Koru::Thread::run) == 3);
 }
 
 TEST_CASE("the base's run returns null and its stop does nothing") {
@@ -252,7 +335,7 @@ TEST_CASE("the base's run returns null and its stop does nothing") {
     CHECK(calls.sequence == "create join ");
 }
 
-// ========================================================================================= start
+// ---- start
 
 TEST_CASE("start runs the derived class's run on a thread of its own, with the argument") {
     SystemCalls calls;
@@ -270,80 +353,25 @@ TEST_CASE("start runs the derived class's run on a thread of its own, with the a
     CHECK(given == &argument);
     CHECK(inside == work.getThreadId());
     CHECK(inside != Koru::Thread::getCurrentThreadId());
-    CHECK(calls.detachState == PTHREAD_CREATE_JOINABLE);
-    CHECK(calls.attributes == 0);
 }
 
 TEST_CASE("the thread begins in ThreadFunction, with the object as its parameter") {
     SystemCalls calls;
     Echo echo;
     CHECK(echo.start(nullptr));
-    bool const inThreadFunction = calls.routine == &Koru::ThreadFunction;
-    CHECK(inThreadFunction);
+    CHECK((calls.routine == &Koru::ThreadFunction));
     CHECK(calls.parameter == static_cast<Koru::Thread*>(&echo));
     CHECK(echo.join() == nullptr);
 }
 
 TEST_CASE("an object starts one thread in its life, however often it is started") {
-    int first = 0;
-    int second = 0;
-    struct Row {
-        char const* label;
-        void (*end)(Koru::Thread&);
-        char const* sequence;
-    };
-    Row const rows[] = {
-        {"running or ended", [](Koru::Thread&) {}, "create "},
-        {"joined", [](Koru::Thread& t) { static_cast<void>(t.join()); }, "create join "},
-        {"detached", [](Koru::Thread& t) { t.detach(); }, "create detach "},
-        {"aborted", [](Koru::Thread& t) { t.abort(); }, "create cancel detach "},
-    };
-    int const threads = threadCount();
-    for (Row const& row : rows) {
-        CAPTURE(row.label);
-        Echo echo;
-        {
-            SystemCalls calls;
-            CHECK(echo.start(&first));
-            CHECK(echo.start(&second));
-            row.end(echo);
-            unsigned long const id = echo.getThreadId();
-            CHECK(echo.start(&second));
-            CHECK(echo.start(nullptr));
-            CHECK(echo.getThreadId() == id);
-            CHECK(calls.sequence == row.sequence);
-        }
-        void* const result = echo.join();
-        CHECK(result == (row.sequence == std::string("create ") ? &first : nullptr));
-        untilThreadsAre(threads);
-        CHECK(echo.runs <= 1); // An aborted one may not have come to it.
-        // The arguments that came too late were not kept.
-        CHECK(Koru::ThreadFunction(&echo) == &first);
-    }
+    CHECK(callsOf("start start-again join start-again join-null") == "create join ");
+    CHECK(callsOf("start start-again detach start-again join-null") == "create detach ");
+    CHECK(callsOf("start start-again abort start-again join-null") == "create cancel detach ");
 }
 
 TEST_CASE("start returns false when no thread can be created, and may be repeated") {
-    int first = 0;
-    int second = 0;
-    SystemCalls calls;
-    Echo echo;
-    for (int const error : {EAGAIN, EINVAL, EPERM}) {
-        calls.createError = error;
-        CHECK(!echo.start(&first));
-        CHECK(calls.attributes == 0);
-        calls.sequence.clear();
-        CHECK(echo.join() == nullptr);
-        echo.abort();
-        CHECK(calls.sequence.empty());
-    }
-    CHECK(echo.runs == 0);
-    calls.createError = 0;
-    CHECK(echo.start(&second));
-    CHECK(calls.detachState == PTHREAD_CREATE_JOINABLE);
-    CHECK(echo.join() == &second);
-    CHECK(echo.runs == 1);
-    CHECK(calls.sequence == "create join ");
-    CHECK(calls.attributes == 0);
+    CHECK(callsOf("fail join-null abort start join") == "create create create create join ");
 }
 
 TEST_CASE("many objects run at once, each with its own argument and result") {
@@ -351,7 +379,7 @@ TEST_CASE("many objects run at once, each with its own argument and result") {
     std::vector<int> numbers(16, 0);
     std::atomic<int> running{0};
     for (int& number : numbers) {
-        workers.emplace_back(new Work([&running](void* argument) {
+        workers.push_back(std::make_unique<Work>([&running](void* argument) {
             ++running;
             while (running < 16) ::usleep(1000);
             ++*static_cast<int*>(argument);
@@ -363,8 +391,7 @@ TEST_CASE("many objects run at once, each with its own argument and result") {
     CHECK(numbers == std::vector<int>(16, 1));
 }
 
-TEST_CASE(
-    "what is written before start is there for run, and what run writes is there after join") {
+TEST_CASE("what is written before start is there for run, and what run writes after join") {
     // Without atomics or locks: the thread sanitizer would report a race.
     struct Adder : Koru::Thread {
         std::vector<int> terms;
@@ -381,7 +408,7 @@ TEST_CASE(
     CHECK(adder.sum == 500500);
 }
 
-// ========================================================================================= join
+// ---- join, detach and abort of threads that end by themselves
 
 TEST_CASE("join waits for the thread and returns what run returned") {
     int object = 0;
@@ -401,110 +428,60 @@ TEST_CASE("join waits for the thread and returns what run returned") {
 }
 
 TEST_CASE("join of a thread that was not started returns null at once and changes nothing") {
-    SystemCalls calls;
-    Echo echo;
-    int value = 0;
-    CHECK(echo.join() == nullptr);
-    CHECK(calls.sequence.empty());
-    CHECK(echo.start(&value));
-    CHECK(calls.detachState == PTHREAD_CREATE_JOINABLE);
-    CHECK(echo.join() == &value);
+    CHECK(callsOf("join-null start join") == "create join ");
 }
 
 TEST_CASE("a second join returns null at once") {
-    SystemCalls calls;
-    Echo echo;
-    int value = 0;
-    CHECK(echo.start(&value));
-    CHECK(echo.join() == &value);
-    CHECK(echo.join() == nullptr);
-    CHECK(echo.join() == nullptr);
-    CHECK(calls.sequence == "create join ");
+    CHECK(callsOf("start join join-null join-null") == "create join ");
 }
 
 TEST_CASE("after join there is nothing to detach or abort") {
-    SystemCalls calls;
-    Echo echo;
-    CHECK(echo.start(nullptr));
-    CHECK(echo.join() == nullptr);
-    echo.detach();
-    echo.abort();
-    CHECK(calls.sequence == "create join ");
-    CHECK(calls.handle == echo.getThreadId());
+    CHECK(callsOf("start join detach abort") == "create join ");
 }
 
-// ========================================================================================= detach
-
-TEST_CASE("a thread detached before its start is created so and cannot be joined") {
-    int const threads = threadCount();
-    std::atomic<bool> go{false};
-    std::atomic<bool> done{false};
-    Work work([&](void* argument) {
-        waitFor(go);
-        done = true;
-        return argument;
-    });
-    {
-        SystemCalls calls;
-        work.detach();
-        CHECK(calls.sequence.empty());
-        CHECK(work.start(&go));
-        CHECK(calls.detachState == PTHREAD_CREATE_DETACHED);
-        CHECK(calls.attributes == 0);
-        CHECK(work.join() == nullptr); // It would wait for ever.
-        work.detach();
-        work.abort();
-        CHECK(calls.sequence == "create ");
-        CHECK(work.getThreadId() == calls.handle);
-    }
-    CHECK(!done);
-    go = true;
-    waitFor(done);
-    untilThreadsAre(threads);
-}
-
-TEST_CASE("a running thread is detached once, and then neither joined nor aborted") {
-    int const threads = threadCount();
-    std::atomic<bool> go{false};
-    std::atomic<bool> done{false};
-    Work work([&](void* argument) {
-        waitFor(go);
-        done = true;
-        return argument;
-    });
-    {
-        SystemCalls calls;
-        CHECK(work.start(&go));
-        work.detach();
-        CHECK(calls.handle == work.getThreadId());
-        work.detach();
-        CHECK(work.join() == nullptr);
-        work.abort();
-        CHECK(calls.sequence == "create detach ");
-    }
-    go = true;
-    waitFor(done);
-    untilThreadsAre(threads);
+TEST_CASE("abort does nothing to a thread that was not started, which may be started then") {
+    CHECK(callsOf("abort start join") == "create join ");
 }
 
 TEST_CASE("detach after a failed start makes the next one start detached") {
-    int const threads = threadCount();
-    Echo echo;
-    {
-        SystemCalls calls;
-        calls.createError = EAGAIN;
-        CHECK(!echo.start(nullptr));
-        echo.detach();
-        calls.createError = 0;
-        CHECK(echo.start(nullptr));
-        CHECK(calls.detachState == PTHREAD_CREATE_DETACHED);
-        CHECK(calls.sequence == "create create ");
-    }
-    while (echo.runs == 0) ::usleep(1000);
-    untilThreadsAre(threads);
+    CHECK(callsOf("fail detach start-detached join-null") == "create create create create ");
 }
 
-// ========================================================================================= ending
+TEST_CASE("a running thread is detached once, before its start or after, and then neither joined "
+          "nor aborted") {
+    for (bool const before : {true, false}) {
+        CAPTURE(before);
+        int const threads = threadCount();
+        std::atomic<bool> go{false};
+        std::atomic<bool> done{false};
+        Work work([&](void* argument) {
+            waitFor(go);
+            done = true;
+            return argument;
+        });
+        {
+            SystemCalls calls;
+            if (before) work.detach();
+            CHECK(calls.sequence.empty());
+            CHECK(work.start(&go));
+            CHECK(calls.attributes == 0);
+            CHECK(calls.detachState ==
+                  (before ? PTHREAD_CREATE_DETACHED : PTHREAD_CREATE_JOINABLE));
+            work.detach();
+            work.detach();
+            CHECK(work.join() == nullptr); // It would wait for ever.
+            work.abort();
+            CHECK(calls.sequence == (before ? "create " : "create detach "));
+            CHECK(calls.handle == work.getThreadId());
+        }
+        CHECK(!done);
+        go = true;
+        waitFor(done);
+        untilThreadsAre(threads);
+    }
+}
+
+// ---- The end of a thread
 
 TEST_CASE("the destructor neither joins nor detaches nor cancels the thread") {
     SystemCalls calls;
@@ -627,7 +604,7 @@ TEST_CASE("stop reaches the derived class's way to ask run to return") {
     CHECK(stoppable.asked.test());
 }
 
-// ========================================================================================= ids
+// ---- Identifiers and sleep
 
 TEST_CASE("the current thread's identifier is that of POSIX and tells threads apart") {
     CHECK(Koru::Thread::getCurrentThreadId() == ::pthread_self());
@@ -651,8 +628,6 @@ TEST_CASE("the current thread's identifier is that of POSIX and tells threads ap
     CHECK(seen[0] != seen[1]);
     CHECK(seen[0] != Koru::Thread::getCurrentThreadId());
 }
-
-// ========================================================================================= sleep
 
 TEST_CASE("sleep is one select with seconds, and with microseconds that are cut to 32 bits") {
     struct Row {
@@ -716,339 +691,188 @@ TEST_CASE("sleep suspends the calling thread for the time given") {
 }
 
 TEST_CASE("a signal ends sleep early") {
-    test::Outcome const outcome = test::inChild([] {
-        ::alarm(120); // Replaced by the timer below as soon as the handler is there.
-        struct sigaction action = {};
-        action.sa_handler = [](int) {};
-        if (::sigaction(SIGALRM, &action, nullptr) != 0) return 1;
-        // Comes again, lest the first one is over before sleep begins.
-        itimerval const timer = {{0, 50000}, {0, 50000}};
-        if (::setitimer(ITIMER_REAL, &timer, nullptr) != 0) return 2;
-        Clock::time_point const before = Clock::now();
-        Koru::Thread::sleep(300000);
-        return Clock::now() - before < std::chrono::seconds(100) ? 0 : 3;
-    });
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == 0);
+    CHECK(test::ending([] {
+              // The timer below takes the place of the child's alarm.
+              struct sigaction action = {};
+              action.sa_handler = [](int) {};
+              if (::sigaction(SIGALRM, &action, nullptr) != 0) return 1;
+              // Comes again, lest the first one is over before sleep begins.
+              itimerval const timer = {{0, 50000}, {0, 50000}};
+              if (::setitimer(ITIMER_REAL, &timer, nullptr) != 0) return 2;
+              Clock::time_point const before = Clock::now();
+              Koru::Thread::sleep(300000);
+              return Clock::now() - before < std::chrono::seconds(100) ? 0 : 3;
+          }) == "exit 0");
 }
 
-// ========================================================================================= abort
-
-namespace {
-
-/// A thread object for a child process, which ends without destructors: there is no moment at which
-/// the last use by an aborted thread is known to be over.
-Work& neverDestroyed(std::function<void*(void*)> body) { return *new Work(std::move(body)); }
-
-/// What an aborted thread does, with a flag to raise when it has begun.
-using Body = std::function<void(std::atomic<bool>&)>;
-
-enum Result { FINE, NOT_STARTED, JOINED };
-
-/// Runs the body in a child process on a thread that is aborted a while after it has begun. The
-/// result is what the child ended with: `FINE` after the thread has been unwound and is gone. A
-/// child where that does not come to pass is ended by its alarm.
-test::Outcome abortedChild(Body const& body, unsigned int microseconds = 20000) {
-    return test::inChild([&] {
-        ::alarm(120);
-        int const threads = threadCount();
-        std::atomic<bool> begun{false};
-        std::atomic<bool> left{false};
-        Work& work = neverDestroyed([&](void*) -> void* {
-            Witness const witness{left};
-            body(begun);
-            for (;;) ::pause(); // Only unwinding leads out.
-        });
-        if (!work.start(nullptr)) return int{NOT_STARTED};
-        waitFor(begun);
-        ::usleep(microseconds);
-        work.abort();
-        if (work.join() != nullptr) return int{JOINED};
-        waitFor(left);
-        untilThreadsAre(threads);
-        return int{FINE};
-    });
-}
-
-void checkAborted(Body const& body, unsigned int microseconds = 20000) {
-    test::Outcome const outcome = abortedChild(body, microseconds);
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == FINE);
-}
-
-} // namespace
-
-TEST_CASE("abort does nothing to a thread that was not started, which may be started then") {
-    SystemCalls calls;
-    Echo echo;
-    int value = 0;
-    echo.abort();
-    CHECK(calls.sequence.empty());
-    CHECK(echo.start(&value));
-    CHECK(calls.detachState == PTHREAD_CREATE_JOINABLE);
-    CHECK(echo.join() == &value);
-    CHECK(echo.runs == 1);
-}
+// ---- abort
 
 TEST_CASE("abort cancels the thread, detaches it, and is done with it") {
-    test::Outcome const outcome = test::inChild([] {
-        ::alarm(120);
-        SystemCalls calls;
-        std::atomic<bool> begun{false};
-        std::atomic<bool> left{false};
-        Work& work = neverDestroyed([&](void*) -> void* {
-            Witness const witness{left};
-            begun = true;
-            for (;;) ::pause();
-        });
-        int const threads = threadCount();
-        if (!work.start(nullptr)) return 1;
-        waitFor(begun);
-        calls.sequence.clear();
-        work.abort();
-        if (calls.sequence != "cancel detach ") return 2;
-        if (calls.handle != work.getThreadId()) return 3;
-        if (work.join() != nullptr) return 4;
-        work.abort();
-        work.detach();
-        if (calls.sequence != "cancel detach ") return 5;
-        waitFor(left);
-        untilThreadsAre(threads);
-        return 0;
-    });
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == 0);
+    checkAborted([](std::atomic<bool>& begun) { begun = true; });
 }
 
 TEST_CASE("abort of a thread that has ended but was not joined leaves nothing of it") {
-    test::Outcome const outcome = test::inChild([] {
-        ::alarm(120);
-        int const threads = threadCount();
-        std::atomic<bool> left{false};
-        Work& work = neverDestroyed([&](void* argument) {
-            Witness const witness{left};
-            return argument;
-        });
-        if (!work.start(&left)) return 1;
-        waitFor(left);
-        untilThreadsAre(threads);
-        work.abort();
-        return work.join() == nullptr ? 0 : 2;
-    });
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == 0);
+    CHECK(test::ending([] {
+              int const threads = threadCount();
+              std::atomic<bool> left{false};
+              Work work([&](void* argument) {
+                  Witness const witness{left};
+                  return argument;
+              });
+              if (!work.start(&left)) return 1;
+              waitFor(left);
+              untilThreadsAre(threads);
+              work.abort();
+              return work.join() == nullptr ? 0 : 2;
+          }) == "exit 0");
 }
 
 TEST_CASE("an aborted thread is unwound out of a pause and out of sleep") {
-    checkAborted([](std::atomic<bool>& begun) { begun = true; });
-    checkAborted([](std::atomic<bool>& begun) {
-        begun = true;
-        for (;;) Koru::Thread::sleep(1000000);
-    });
-    checkAborted([](std::atomic<bool>& begun) {
-        begun = true;
-        for (;;) Koru::Thread::sleep(0);
-    });
+    checkAbortedIn([] { ::pause(); });
+    checkAbortedIn([] { Koru::Thread::sleep(1000000); });
+    checkAbortedIn([] { Koru::Thread::sleep(0); });
 }
 
 TEST_CASE("an aborted thread that computes is unwound at its next cancellation point") {
-    checkAborted([](std::atomic<bool>& begun) {
-        begun = true;
-        for (unsigned volatile i = 0;; i = i + 1) ::pthread_testcancel();
+    unsigned volatile i = 0;
+    checkAbortedIn([&] {
+        i = i + 1;
+        ::pthread_testcancel();
     });
 }
 
 TEST_CASE("all scopes of an aborted thread are left, those that catch everything included") {
-    test::Outcome const outcome = test::inChild([] {
-        ::alarm(120);
-        int const threads = threadCount();
-        std::atomic<bool> begun{false};
-        std::atomic<bool> outer{false};
-        std::atomic<bool> inner{false};
-        std::atomic<bool> caught{false};
-        Work& work = neverDestroyed([&](void*) -> void* {
-            Witness const outerWitness{outer};
-            try {
-                Witness const innerWitness{inner};
-                begun = true;
-                for (;;) ::pause();
-            } catch (...) {
-                caught = true;
-                throw;
-            }
-        });
-        if (!work.start(nullptr)) return 1;
-        waitFor(begun);
-        work.abort();
-        waitFor(outer);
-        untilThreadsAre(threads);
-        return inner && caught ? 0 : 2;
-    });
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == 0);
+    CHECK(test::ending([] {
+              std::atomic<bool> inner{false};
+              std::atomic<bool> caught{false};
+              int const result = abortedAfter(0, [&](std::atomic<bool>& begun) {
+                  try {
+                      Witness const witness{inner};
+                      begun = true;
+                      for (;;) ::pause();
+                  } catch (...) {
+                      caught = true;
+                      throw;
+                  }
+              });
+              return inner && caught ? result : 9;
+          }) == "exit 0");
 }
 
 TEST_CASE("an aborted thread is unwound out of a wait for an event, which stays usable") {
-    test::Outcome const outcome = test::inChild([] {
-        ::alarm(120);
-        int const threads = threadCount();
-        Koru::Event event(false);
-        for (unsigned long const timeout : {0xFFFFFFFFUL, 1000UL}) {
-            std::atomic<bool> begun{false};
-            std::atomic<bool> left{false};
-            Work& work = neverDestroyed([&](void*) -> void* {
-                Witness const witness{left};
-                begun = true;
-                for (;;) static_cast<void>(event.wait(timeout));
-            });
-            if (!work.start(nullptr)) return 1;
-            waitFor(begun);
-            ::usleep(20000);
-            work.abort();
-            waitFor(left);
-            untilThreadsAre(threads);
-        }
-        event.signal();
-        return event.test() ? 0 : 2;
-    });
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == 0);
+    for (unsigned long const timeout : {0xFFFFFFFFUL, 1000UL}) {
+        CAPTURE(timeout);
+        CHECK(test::ending([&] {
+                  Koru::Event event(false);
+                  int const result = abortedAfter(20000, [&](std::atomic<bool>& begun) {
+                      begun = true;
+                      for (;;) static_cast<void>(event.wait(timeout));
+                  });
+                  event.signal();
+                  return event.test() ? result : 9;
+              }) == "exit 0");
+    }
 }
 
 TEST_CASE("an aborted thread is unwound out of waiting for a lock, of a mutex and of a file") {
     test::TempDir const directory;
     Koru::Mutex mutex;
     mutex.lock(1);
-    checkAborted([&](std::atomic<bool>& begun) {
-        begun = true;
-        mutex.lock(0xFFFFFFFFUL);
-    });
+    checkAbortedIn([&] { mutex.lock(0xFFFFFFFFUL); });
     mutex.unlock();
 
     Koru::File file(directory.wide("file"));
     REQUIRE(file.lock());
-    checkAborted([&](std::atomic<bool>& begun) {
-        begun = true;
-        static_cast<void>(file.lock());
-    });
-    checkAborted([&](std::atomic<bool>& begun) {
-        begun = true;
-        file.open(Koru::File::WRITE);
-    });
+    checkAbortedIn([&] { static_cast<void>(file.lock()); });
+    checkAbortedIn([&] { file.open(Koru::File::WRITE); });
     CHECK(file.unlock());
 }
 
 TEST_CASE("a lock that an aborted thread waited for is free when its holder lets it go") {
-    test::TempDir const directory;
-    test::Outcome const outcome = test::inChild([&] {
-        ::alarm(120);
-        int const threads = threadCount();
-        Koru::File file(directory.wide("file"));
-        if (!file.lock()) return 1;
-        std::atomic<bool> begun{false};
-        std::atomic<bool> left{false};
-        Work& waiter = neverDestroyed([&](void*) -> void* {
-            Witness const witness{left};
-            begun = true;
-            static_cast<void>(file.lock());
-            return nullptr;
-        });
-        if (!waiter.start(nullptr)) return 2;
-        waitFor(begun);
-        ::usleep(20000);
-        waiter.abort();
-        waitFor(left);
-        untilThreadsAre(threads);
-        if (!file.unlock()) return 3;
-        Work other([&](void* argument) -> void* {
-            return file.lock() && file.unlock() ? argument : nullptr;
-        });
-        if (!other.start(&file)) return 4;
-        return other.join() == &file ? 0 : 5;
-    });
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == 0);
+    CHECK(test::ending([] {
+              Koru::File file;
+              if (!file.lock()) return 9;
+              int const result = abortedAfter(20000, [&](std::atomic<bool>& begun) {
+                  begun = true;
+                  static_cast<void>(file.lock());
+              });
+              if (!file.unlock()) return 8;
+              Work other(
+                  [&](void* given) { return file.lock() && file.unlock() ? given : nullptr; });
+              return other.start(&file) && other.join() == &file ? result : 7;
+          }) == "exit 0");
 }
 
-TEST_CASE("an aborted thread is unwound out of opening a file that lets it wait") {
-    test::TempDir const directory;
-    REQUIRE(::mkfifo((directory / "pipe").c_str(), 0600) == 0);
+TEST_CASE_FIXTURE(Pipe, "an aborted thread is unwound out of opening a file that lets it wait") {
     for (unsigned long const mode : {Koru::File::READ + 0, Koru::File::WRITE + 0}) {
         CAPTURE(mode);
         checkAborted([&](std::atomic<bool>& begun) {
-            Koru::File pipe(directory.wide("pipe"));
+            Koru::File pipe(name());
             begun = true;
             pipe.open(mode);
         });
     }
 }
 
-TEST_CASE("an aborted thread is unwound out of reading and writing a pipe that lets it wait") {
-    test::TempDir const directory;
-    REQUIRE(::mkfifo((directory / "pipe").c_str(), 0600) == 0);
+TEST_CASE_FIXTURE(Pipe, "an aborted thread is unwound out of reading and writing a pipe that lets "
+                        "it wait") {
     // Both ends are held open here, so opening does not wait; nobody reads or writes.
     int const end = ::open((directory / "pipe").c_str(), O_RDWR | O_CLOEXEC);
     REQUIRE(end >= 0);
     checkAborted([&](std::atomic<bool>& begun) {
-        Koru::File pipe(directory.wide("pipe"));
+        Koru::File pipe(name());
         pipe.open(Koru::File::READ);
         begun = true;
         static_cast<void>(pipe.get());
     });
     checkAborted([&](std::atomic<bool>& begun) {
-        Koru::File pipe(directory.wide("pipe"));
+        Koru::File pipe(name());
         pipe.open(Koru::File::WRITE);
         std::string const block(4096, 'x');
-        for (int written = 0; written < 16; ++written) {
-            pipe.write(block.data(), static_cast<std::streamsize>(block.size()));
-        }
+        for (int written = 0; written < 16; ++written) pipe << block.c_str();
         pipe.flush();
         begun = true;
-        for (;;) pipe.write(block.data(), static_cast<std::streamsize>(block.size())).flush();
+        for (;;) pipe << block.c_str() << std::flush;
     });
     ::close(end);
 }
 
 TEST_CASE("a thread may be aborted anywhere in opening, writing and closing files") {
     test::TempDir const directory;
+    auto const body = [&](std::atomic<bool>& begun) {
+        for (;;) {
+            Koru::File file(directory.wide("file"));
+            file.open(Koru::File::READ | Koru::File::WRITE);
+            file << "some text" << std::flush;
+            begun = true;
+            if (file.lock()) static_cast<void>(file.unlock());
+            file.close();
+            Koru::File left(directory.wide("left"));
+            left.open(Koru::File::WRITE);
+            left << "more text";
+        }
+    };
     for (unsigned int round = 0; round < 12; ++round) {
         CAPTURE(round);
-        checkAborted(
-            [&](std::atomic<bool>& begun) {
-                for (;;) {
-                    Koru::File file(directory.wide("file"));
-                    file.open(Koru::File::READ | Koru::File::WRITE);
-                    file << "some text" << std::flush;
-                    begun = true;
-                    if (file.lock()) static_cast<void>(file.unlock());
-                    file.close();
-                    Koru::File left(directory.wide("left"));
-                    left.open(Koru::File::WRITE);
-                    left << "more text";
-                }
-            },
-            round * 300);
+        checkAborted(body, round * 300);
     }
 }
 
 TEST_CASE("cancellation passes through ThreadFunction on a thread of another's making") {
-    test::Outcome const outcome = test::inChild([] {
-        ::alarm(120);
-        std::atomic<bool> begun{false};
-        std::atomic<bool> left{false};
-        Work work([&](void*) -> void* {
-            Witness const witness{left};
-            begun = true;
-            for (;;) ::pause();
-        });
-        bool const cancelled =
-            test::endsCancelled([&] { static_cast<void>(Koru::ThreadFunction(&work)); },
-                                [&](pthread_t thread) {
-                                    waitFor(begun);
-                                    ::pthread_cancel(thread);
-                                });
-        return cancelled && left ? 0 : 1;
-    });
-    CHECK(outcome.signal == 0);
-    CHECK(outcome.exitCode == 0);
+    CHECK(test::ending([] {
+              std::atomic<bool> begun{false};
+              std::atomic<bool> left{false};
+              Work work([&](void*) -> void* {
+                  Witness const witness{left};
+                  begun = true;
+                  for (;;) ::pause();
+              });
+              bool const cancelled =
+                  test::endsCancelled([&] { static_cast<void>(Koru::ThreadFunction(&work)); },
+                                      [&](pthread_t thread) {
+                                          waitFor(begun);
+                                          ::pthread_cancel(thread);
+                                      });
+              return cancelled && left ? 0 : 1;
+          }) == "exit 0");
 }
