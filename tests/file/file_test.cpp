@@ -23,6 +23,7 @@
 #include "file/filefixture.h"
 #include "support/cancellation.h"
 #include "support/holder.h"
+#include "support/script.h"
 #include "support/slots.h"
 #include "support/subprocess.h"
 
@@ -42,9 +43,41 @@ unsigned long const MODES[] = {READ, WRITE, UPDATE, 0};
 /// The states that a stream may be in.
 State const STATES[] = {GOOD, FAIL, BAD, END, FAIL | BAD | END};
 
-/// Whether the file is closed, in no mode and in the state, and nobody holds its lock.
-bool isClosed(File& file, State state) {
-    return !file.is_open() && file.getMode() == 0 && file.rdstate() == state && isFree(file);
+std::string const CLOSED = "closed, mode 0";
+
+/// Whether the file is open, its mode and the state of its stream. Nobody may hold its lock.
+std::string shown(File& file) {
+    CHECK(isFree(file));
+    char const* const state = file.rdstate() == GOOD   ? "good"
+                              : file.rdstate() == FAIL ? "fail"
+                                                       : "";
+    return (file.is_open() ? "open, mode " : "closed, mode ") + std::to_string(file.getMode()) +
+           ", " + state;
+}
+
+test::Words<OnFile> const WORDS = {
+    {"read", [](OnFile& on) { on.file.open(READ); }},
+    {"write", [](OnFile& on) { on.file.open(WRITE); }},
+    {"update", [](OnFile& on) { on.file.open(UPDATE); }},
+    {"close", [](OnFile& on) { on.file.close(); }},
+    {"synchronize", [](OnFile& on) { on.file.synchronize(); }},
+    {"not-read", [](OnFile& on) { CHECK(complaint([&] { on.file.open(READ); }) == NOT_OPENED); }},
+    {"not-synchronize",
+     [](OnFile& on) { CHECK(complaint([&] { on.file.synchronize(); }) == NOT_OPENED); }},
+    {"put", [](OnFile& on) { on.file << "content"; }},
+    {"put-NEW", [](OnFile& on) { on.file << "NEW"; }},
+    {"mode-write", [](OnFile& on) { on.file.setMode(WRITE); }},
+    {"mode-binary", [](OnFile& on) { on.file.setMode(BINARY); }},
+    // What others do:
+    {"store", [](OnFile& on) { on.store("content"); }},
+    {"store-new", [](OnFile& on) { on.store("new"); }},
+    {"delete", [](OnFile& on) { std::filesystem::remove(on.path); }},
+};
+
+/// What a script makes of the object and of the file on the disk.
+std::string after(OnFile& on, std::string const& script) {
+    follow(on, WORDS, script);
+    return shown(on.file) + (isThere(on.path) ? ": " + on.stored() : ", no file");
 }
 
 /// A file whose overrides note the calls and whether the lock was held meanwhile.
@@ -170,7 +203,7 @@ TEST_CASE_FIXTURE(OnFile, "a new file is closed, in mode 0 and in a good state")
     CHECK(nameless.getName() == L"");
     CHECK(file.getName() == dir.wide("a"));
     for (File* const each : {&nameless, &file}) {
-        CHECK(isClosed(*each, GOOD));
+        CHECK(shown(*each) == CLOSED + ", good");
         CHECK(each->exceptions() == GOOD);
     }
     CHECK(!isThere(path));
@@ -264,11 +297,7 @@ TEST_CASE("open opens, creates, empties or fails as its mode says") {
 }
 
 TEST_CASE_FIXTURE(OnContent, "updating begins at the start and keeps what is not overwritten") {
-    file.open(UPDATE);
-    CHECK(file.tellg() == std::streampos(0));
-    file << "NEW";
-    file.close();
-    CHECK(stored() == "NEWtent");
+    CHECK(after(*this, "update put-NEW close") == "closed, mode 0, good: NEWtent");
 }
 
 TEST_CASE_FIXTURE(OnFile, "bytes pass unchanged with and without the binary bit") {
@@ -297,7 +326,7 @@ TEST_CASE_FIXTURE(OnContent, "a file that cannot be opened is reported, whatever
             INFO(Koru::make_string(name), " in mode ", mode);
             File other(name);
             CHECK(complaint([&] { other.open(mode); }) == NOT_OPENED);
-            CHECK(isClosed(other, FAIL));
+            CHECK(shown(other) == CLOSED + ", fail");
         }
     }
     CHECK(stored() == "content");
@@ -373,14 +402,8 @@ TEST_CASE_FIXTURE(OnFile, "attempts that fail add the fail state") {
     }
 }
 
-TEST_CASE_FIXTURE(OnFile, "a file that could not be opened can be later, and stays in the fail "
-                          "state") {
-    CHECK(complaint([&] { file.open(READ); }) == NOT_OPENED);
-    store("content");
-    file.open(READ);
-    CHECK(file.is_open());
-    CHECK(file.getMode() == READ);
-    CHECK(file.rdstate() == FAIL);
+TEST_CASE_FIXTURE(OnFile, "a file not opened can be opened later, and stays in the fail state") {
+    CHECK(after(*this, "not-read store read") == "open, mode 1, fail: content");
     file.clear();
     CHECK(contentOf(file) == "content");
 }
@@ -392,38 +415,25 @@ TEST_CASE("opening an open file changes its mode and sets the fail state, no mor
             OnContent on;
             on.file.open(first);
             on.file.ignore(3);
-            CHECK(complaint([&] { on.file.open(second); }) == "<nothing>");
-            CHECK(on.file.getMode() == second);
-            CHECK(on.file.is_open());
-            CHECK(on.file.rdstate() == FAIL);
+            on.file.open(second);
+            CHECK(shown(on.file) == "open, mode " + std::to_string(second) + ", fail");
             on.file.clear();
             CHECK(on.file.tellg() == std::streampos(3));
             CHECK(contentOf(on.file) == "content");
             CHECK(canWrite(on.file) == ((first & WRITE) != 0));
-            CHECK(isFree(on.file));
         }
     }
 }
 
 TEST_CASE_FIXTURE(OnFile, "what an open file has buffered survives being opened again") {
-    file.open(WRITE);
-    file << "buffered";
-    file.open(WRITE);
-    file.close();
-    CHECK(stored() == "buffered");
+    CHECK(after(*this, "write put write close") == "closed, mode 0, fail: content");
 }
 
-TEST_CASE_FIXTURE(OnFile,
-                  "a file can be opened, closed and opened in another mode again and again") {
+TEST_CASE_FIXTURE(OnFile, "a file can be opened and closed in one mode and another again") {
     for (int round = 0; round < 5; ++round) {
-        file.open(WRITE);
-        file << "round " << round;
-        file.close();
-        file.open(READ | BINARY);
-        CHECK(contentOf(file) == "round " + std::to_string(round));
-        CHECK(file.getMode() == (READ | BINARY));
-        file.close();
-        CHECK(file.good());
+        CHECK(after(*this, "write put close read") == "open, mode 1, good: content");
+        CHECK(contentOf(file) == "content");
+        CHECK(after(*this, "close") == "closed, mode 0, good: content");
     }
 }
 
@@ -442,12 +452,8 @@ TEST_CASE_FIXTURE(OnFile, "open and close set the mode themselves, whatever an o
 // ---- close
 
 TEST_CASE_FIXTURE(OnFile, "close writes out what is buffered, closes and resets the mode") {
-    file.open(WRITE | BINARY);
-    file << "content";
-    CHECK(stored() == "");
-    file.close();
-    CHECK(stored() == "content");
-    CHECK(isClosed(file, GOOD));
+    CHECK(after(*this, "write put") == "open, mode 2, good: ");
+    CHECK(after(*this, "close") == "closed, mode 0, good: content");
     CHECK(file.getName() == dir.wide("a"));
 }
 
@@ -462,27 +468,14 @@ TEST_CASE_FIXTURE(OnContent, "close leaves the state of the stream as it was") {
     }
 }
 
-TEST_CASE_FIXTURE(OnFile, "closing a file never opened sets the fail state and touches nothing "
-                          "else") {
-    file.setMode(UPDATE);
-    CHECK(complaint([&] { file.close(); }) == "<nothing>");
-    CHECK(isClosed(file, FAIL));
-    CHECK(!isThere(path));
+TEST_CASE_FIXTURE(OnFile, "closing a file never opened sets the fail state and no more") {
+    CHECK(after(*this, "mode-write close") == "closed, mode 0, fail, no file");
+    CHECK(after(*this, "store close") == "closed, mode 0, fail: content");
     CHECK(file.getName() == dir.wide("a"));
-
-    store("content");
-    CHECK(complaint([&] { file.close(); }) == "<nothing>");
-    CHECK(stored() == "content");
 }
 
 TEST_CASE_FIXTURE(OnFile, "closing twice is harmless, and the mode is 0") {
-    file.open(WRITE);
-    file << "content";
-    file.close();
-    file.setMode(WRITE);
-    CHECK(complaint([&] { file.close(); }) == "<nothing>");
-    CHECK(isClosed(file, FAIL));
-    CHECK(stored() == "content");
+    CHECK(after(*this, "write put close mode-write close") == "closed, mode 0, fail: content");
 }
 
 TEST_CASE("what cannot be written out shows in the stream's state, and the file is closed") {
@@ -490,8 +483,8 @@ TEST_CASE("what cannot be written out shows in the stream's state, and the file 
     file.open(WRITE);
     file << "more than nothing";
     CHECK(file.good());
-    CHECK(complaint([&] { file.close(); }) == "<nothing>");
-    CHECK(isClosed(file, FAIL));
+    file.close();
+    CHECK(shown(file) == CLOSED + ", fail");
 }
 
 TEST_CASE("no descriptor stays open after close or destruction") {
@@ -560,10 +553,7 @@ TEST_CASE_FIXTURE(OnRecorder, "synchronize closes and reopens through the virtua
     base.synchronize();
     std::string const number = std::to_string(mode);
     CHECK(recorder.calls == Strings{"close in mode " + number, "open " + number});
-    CHECK(recorder.is_open());
-    CHECK(recorder.getMode() == mode);
-    CHECK(recorder.rdstate() == GOOD);
-    CHECK(isFree(recorder));
+    CHECK(shown(recorder) == "open, mode " + number + ", good");
 }
 
 TEST_CASE_FIXTURE(OnRecorder, "synchronize leaves a closed file as it is") {
@@ -571,11 +561,8 @@ TEST_CASE_FIXTURE(OnRecorder, "synchronize leaves a closed file as it is") {
     recorder.setMode(UPDATE);
     recorder.synchronize();
     CHECK(recorder.calls == Strings{});
-    CHECK(recorder.getMode() == UPDATE);
-    CHECK(recorder.rdstate() == GOOD);
-    CHECK(!recorder.is_open());
+    CHECK(shown(recorder) == "closed, mode 3, good");
     CHECK(!isThere(path));
-    CHECK(isFree(recorder));
 }
 
 TEST_CASE_FIXTURE(OnRecorder, "synchronize opens in the mode that setMode left, here read-only") {
@@ -603,10 +590,7 @@ TEST_CASE_FIXTURE(OnContent,
 }
 
 TEST_CASE_FIXTURE(OnFile, "synchronize writes out and goes back to the start") {
-    file.open(UPDATE);
-    file << "content";
-    file.synchronize();
-    CHECK(stored() == "content");
+    CHECK(after(*this, "update put synchronize") == "open, mode 3, good: content");
     CHECK(file.tellg() == std::streampos(0));
     CHECK(contentOf(file) == "content");
 }
@@ -614,41 +598,23 @@ TEST_CASE_FIXTURE(OnFile, "synchronize writes out and goes back to the start") {
 TEST_CASE_FIXTURE(OnContent, "synchronize sees what others wrote meanwhile") {
     file.open(READ);
     CHECK(contentOf(file) == "content");
-    std::filesystem::remove(path);
-    store("new");
-    file.synchronize();
+    CHECK(after(*this, "delete store-new synchronize") == "open, mode 1, good: new");
     CHECK(contentOf(file) == "new");
 }
 
 TEST_CASE_FIXTURE(OnFile, "synchronize empties a file that is open for writing only") {
-    file.open(WRITE);
-    file << "content";
-    file.synchronize();
-    CHECK(stored() == "");
-    CHECK(file.getMode() == WRITE);
+    CHECK(after(*this, "write put synchronize") == "open, mode 2, good: ");
 }
 
 TEST_CASE_FIXTURE(OnFile, "synchronize creates a file that is gone when its mode is both") {
-    file.open(UPDATE);
-    file << "content";
-    std::filesystem::remove(path);
-    file.synchronize();
-    CHECK(stored() == "");
-    CHECK(file.good());
+    CHECK(after(*this, "update put delete synchronize") == "open, mode 3, good: ");
 }
 
 TEST_CASE_FIXTURE(OnContent, "synchronize fails on a file that cannot be opened again, which is "
                              "closed then") {
-    SUBCASE("since it is gone") {
-        file.open(READ);
-        std::filesystem::remove(path);
-    }
-    SUBCASE("since the mode is neither reading nor writing") {
-        file.open(UPDATE);
-        file.setMode(BINARY);
-    }
-    CHECK(complaint([&] { file.synchronize(); }) == NOT_OPENED);
-    CHECK(isClosed(file, FAIL));
+    CHECK(after(*this, "update mode-binary not-synchronize") == "closed, mode 0, fail: content");
+    file.clear();
+    CHECK(after(*this, "read delete not-synchronize") == "closed, mode 0, fail, no file");
 }
 
 TEST_CASE_FIXTURE(OnRecorder, "what an override throws comes out of synchronize, and the lock is "
@@ -657,15 +623,12 @@ TEST_CASE_FIXTURE(OnRecorder, "what an override throws comes out of synchronize,
     recorder.failing = "close";
     CHECK(messageOf<std::logic_error>([&] { recorder.synchronize(); }) == "close");
     CHECK(recorder.calls == Strings{"close in mode 1"});
-    CHECK(recorder.is_open());
-    CHECK(recorder.getMode() == READ);
-    CHECK(isFree(recorder));
+    CHECK(shown(recorder) == "open, mode 1, good");
 
     recorder.failing = "open";
     CHECK(messageOf<std::logic_error>([&] { recorder.synchronize(); }) == "open");
     CHECK(recorder.calls == Strings{"close in mode 1", "close in mode 1", "open 1"});
-    CHECK(!recorder.is_open());
-    CHECK(isFree(recorder));
+    CHECK(shown(recorder) == CLOSED + ", good");
 }
 
 // ---- Destruction
