@@ -1,5 +1,5 @@
-// What the system refuses for a passing reason loses nothing: failing calls, cancelled threads and
-// streams that throw, for a plain file, a log and the structured files.
+// What the system refuses for a passing reason loses nothing: failing calls, cancelled threads,
+// streams that throw and memory that runs out, for a plain file, a log and the structured files.
 #include <doctest/doctest.h>
 
 #include <pthread.h>
@@ -7,7 +7,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <cstddef>
 #include <cstring>
 #include <filesystem>
 #include <functional>
@@ -15,11 +17,13 @@
 #include <memory>
 #include <stdexcept>
 #include <string>
+#include <type_traits>
 
 #include <koru/file.h>
 #include <koru/logfile.h>
 
 #include "support/cancellation.h"
+#include "support/failingmemory.h"
 #include "support/structuredfile.h"
 #include "support/subprocess.h"
 #include "support/systemcalls.h"
@@ -28,10 +32,13 @@
 
 using Koru::LogFile;
 using test::Call;
+using test::Failing;
 using test::FailingCall;
 using test::Flat;
+using test::memoryRanOut;
 using test::readFile;
 using test::Records;
+using test::runOutOfMemory;
 using test::Sectioned;
 using test::writeFile;
 
@@ -91,6 +98,9 @@ struct Stored : Place {
     std::string const old;
 };
 
+using One = std::integral_constant<Failing, Failing::ONE>;
+using OneAndAllLater = std::integral_constant<Failing, Failing::ONE_AND_ALL_LATER>;
+
 /// Runs a step in a thread that is cancelled at one of its cancellation points.
 /// @return whether it came to that one
 template <class Step>
@@ -107,8 +117,9 @@ bool cancelledAt(long point, Step step) {
 
 // ---- Failing to open
 
-TEST_CASE_FIXTURE(Place, "a file that cannot be opened for a passing reason is tried once and "
-                         "keeps its content") {
+TEST_CASE_FIXTURE(
+    Place,
+    "a file that cannot be opened for a passing reason is tried once and keeps its content") {
     writeFile(path, "content");
     forPassingReasons([&](int error) {
         for (unsigned long const mode : {READ, WRITE, READ_WRITE}) {
@@ -148,19 +159,6 @@ TEST_CASE_FIXTURE(Place, "a second attempt that fails is the failure to open") {
     CHECK(complaint([&] { file.open(READ_WRITE); }) == NOT_OPENED);
     CHECK(fault.made() == 2);
     CHECK(!std::filesystem::exists(path));
-}
-
-TEST_CASE_FIXTURE(Place, "errno tells why a file could not be opened") {
-    writeFile(path, "content");
-    Koru::File file(wide());
-    FailingCall const fault(Call::OPEN, EMFILE);
-    int error = 0;
-    try {
-        file.open(READ_WRITE);
-    } catch (std::runtime_error const&) {
-        error = errno;
-    }
-    CHECK(error == EMFILE);
 }
 
 TEST_CASE_TEMPLATE("a structured file that cannot be opened keeps its content, also after it is "
@@ -408,7 +406,7 @@ TEST_CASE_TEMPLATE("a last line that the end of the file cuts off is lost where 
     CHECK(test::sizeOf<Family>(file) == 2);
 }
 
-// ---- Flushing, seeking and memory
+// ---- Flushing and seeking
 
 TEST_CASE_TEMPLATE("a file that cannot be gone back in is no empty file", Family, Sectioned, Flat,
                    Records) {
@@ -445,6 +443,8 @@ TEST_CASE_TEMPLATE("output that cannot be written out is a failure to read the f
     file.setMode(0);
 }
 
+// ---- Memory
+
 TEST_CASE_TEMPLATE("a size that the system claims is only a guess", Family, Sectioned, Flat) {
     int const count = 200000; // more than the first piece of memory holds
     Stored<Family> const stored(count);
@@ -456,4 +456,77 @@ TEST_CASE_TEMPLATE("a size that the system claims is only a guess", Family, Sect
         test::claimedSize = -1;
         CHECK(test::sizeOf<Family>(file) == count);
     }
+}
+
+TEST_CASE_TEMPLATE("a log that runs out of memory while it is opened is closed and can be opened "
+                   "again",
+                   Times, One, OneAndAllLater) {
+    Place const place;
+    writeFile(place.path, "line\n");
+    for (long before = 0;; ++before) {
+        CAPTURE(before);
+        LogFile log(place.path);
+        std::string const outcome = runOutOfMemory(before, Times::value, [&] { log.open(3U); });
+        if (!memoryRanOut()) break;
+        CHECK(outcome == "std::bad_alloc");
+        CHECK(!log.is_open());
+        log.clear();
+        log.open(3U);
+        log << "x\n" << std::flush;
+        CHECK(log.good());
+    }
+    CHECK(place.content().substr(0, 7) == "line\nx\n");
+}
+
+TEST_CASE_FIXTURE(Place,
+                  "a file that runs out of memory while it is opened is closed and keeps its "
+                  "content") {
+    writeFile(path, "content");
+    for (long before = 0;; ++before) {
+        CAPTURE(before);
+        Koru::File file(wide());
+        std::string const outcome =
+            runOutOfMemory(before, Failing::ONE_AND_ALL_LATER, [&] { file.open(READ_WRITE); });
+        if (!memoryRanOut()) break;
+        CHECK(outcome == "std::bad_alloc");
+        CHECK(!file.is_open());
+    }
+    CHECK(content() == "content");
+}
+
+TEST_CASE_TEMPLATE("lines read before memory runs out are held", Family, Sectioned, Flat) {
+    Stored<Family> const stored(5000);
+    int most = 0;
+    for (long before = 0;; ++before) {
+        CAPTURE(before);
+        typename Family::File file(stored.path);
+        std::string const outcome = runOutOfMemory(before, Failing::ONE, [&] { file.open(READ); });
+        int const held = static_cast<int>(test::sizeOf<Family>(file));
+        CHECK(test::holds<Family>(file, 0, held));
+        if (!memoryRanOut()) break;
+        if (outcome == "done") CHECK(held == 5000); // only a guess
+        most = std::max(most, held);
+    }
+    CHECK(most > 0);
+}
+
+TEST_CASE_TEMPLATE("a large file of comments takes its own size and no room for entries" *
+                       doctest::skip(!test::ADDRESS_SPACE_CAN_BE_LIMITED),
+                   Family, Sectioned, Flat) {
+    std::size_t const large = 190 * 1024 * 1024;
+    Stored<Family> const stored(2);
+    writeFile(stored.path, stored.old + "#");
+    // The rest of the comment is a hole, which takes no place on the disk.
+    REQUIRE(::truncate(stored.path.c_str(), static_cast<off_t>(large)) == 0);
+    CHECK(test::ending([&] {
+              std::size_t const pages =
+                  std::stoul(readFile("/proc/self/statm")); // of address space
+              std::size_t const most =
+                  pages * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE)) + large + large / 8;
+              rlimit const limit = {most, most};
+              if (::setrlimit(RLIMIT_AS, &limit) != 0) return 1;
+              typename Family::File file(stored.path);
+              file.open(READ);
+              return test::sizeOf<Family>(file) == 2 ? 0 : 2;
+          }) == "exit 0");
 }

@@ -1,12 +1,17 @@
 // The file base class: its shape, opening and closing, reopening and destruction.
+#include <koru/datafile.h>
+#include <koru/event.h>
 #include <koru/file.h>
 #include <koru/initializationfile.h>
+#include <koru/logfile.h>
 #include <koru/mutex.h>
+#include <koru/propertyfile.h>
 #include <koru/string.h>
 
 #include <pthread.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cstddef>
 #include <filesystem>
 #include <fstream>
@@ -14,6 +19,7 @@
 #include <memory>
 #include <stdexcept>
 #include <string>
+#include <thread>
 #include <type_traits>
 #include <utility>
 #include <vector>
@@ -27,8 +33,11 @@
 #include "support/slots.h"
 #include "support/subprocess.h"
 
+using Koru::DataFile;
 using Koru::File;
 using Koru::InitializationFile;
+using Koru::LogFile;
+using Koru::PropertyFile;
 using test::slotOf;
 using test::slotOfOpen;
 using namespace test;
@@ -106,6 +115,13 @@ private:
     // They end when the lock is released, which is after the call.
     std::vector<std::unique_ptr<Contender>> contenders_;
 };
+
+template <class Object, class Mode, class = void>
+struct OpensWith : std::false_type {};
+
+template <class Object, class Mode>
+struct OpensWith<Object, Mode, decltype(std::declval<Object&>().open(std::declval<Mode>()), void())>
+    : std::true_type {};
 
 struct OnRecorder : OnContent {
     Recorder recorder{dir.wide("a")};
@@ -194,6 +210,68 @@ TEST_CASE("the virtual functions of an initialization file follow those of the f
     CHECK(slotOf(&InitializationFile::removeKey) == 12);
     CHECK(slotOf(&InitializationFile::getValue) == 13);
     CHECK(slotOf(&InitializationFile::setValue) == 14);
+}
+
+// ---- How the file classes meet a caller's code
+
+TEST_CASE_TEMPLATE("a path converts to the file that is there", Object, DataFile,
+                   InitializationFile, PropertyFile, LogFile) {
+    static_assert(std::is_convertible<File::Path, Object>::value, "");
+    auto const nameOf = [](Object const& object) { return object.getName(); };
+    CHECK(nameOf(File::Path("/folder/name")) == L"/folder/name");
+}
+
+TEST_CASE("a name converts to a file, a flag to an event") {
+    static_assert(std::is_convertible<std::wstring, File>::value, "");
+    static_assert(std::is_convertible<bool, Koru::Event>::value, "");
+    auto const nameOf = [](File const& file) { return file.getName(); };
+    CHECK(nameOf(std::wstring(L"name")) == L"name");
+}
+
+TEST_CASE_TEMPLATE("the open modes of a stream do not pass for a file's modes", Object, File,
+                   DataFile, InitializationFile, PropertyFile) {
+    static_assert(!OpensWith<Object, std::ios_base::openmode>::value, "");
+    static_assert(!OpensWith<Object, decltype(std::ios::in | std::ios::out)>::value, "");
+    static_assert(OpensWith<Object, unsigned long>::value, "");
+    static_assert(OpensWith<Object, unsigned int>::value && OpensWith<Object, int>::value, "");
+    static_assert(OpensWith<Object, decltype(File::READ)>::value, "");
+}
+
+TEST_CASE("a log keeps the one signature that it has") {
+    static_assert(std::is_same<decltype(&LogFile::open), void (LogFile::*)(unsigned int)>::value,
+                  "");
+}
+
+TEST_CASE("the mode is an unsigned long in place and size") {
+    struct Layout : std::fstream {
+        std::wstring name;
+        unsigned long mode;
+        Koru::Mutex lock;
+    };
+    CHECK(sizeof(File) == sizeof(Layout));
+    static_assert(sizeof(std::atomic<unsigned long>) == sizeof(unsigned long), "");
+    static_assert(alignof(std::atomic<unsigned long>) == alignof(unsigned long), "");
+}
+
+TEST_CASE_FIXTURE(OnContent, "the mode and the name may be asked for and the mode set while a file "
+                             "is opened") {
+    PropertyFile shared(path);
+    std::atomic<bool> done{false};
+    std::thread other([&] {
+        unsigned long seen = 0;
+        while (!done) {
+            seen |= shared.getMode();
+            if (shared.getName().empty()) seen |= 0x100;
+            shared.setMode(READ);
+        }
+        CHECK((seen & ~READ) == 0);
+    });
+    for (int i = 0; i < 200; ++i) {
+        shared.open(READ);
+        shared.close();
+    }
+    done = true;
+    other.join();
 }
 
 // ---- Construction, name and mode
@@ -296,7 +374,8 @@ TEST_CASE("open opens, creates, empties or fails as its mode says") {
     }
 }
 
-TEST_CASE_FIXTURE(OnContent, "updating begins at the start and keeps what is not overwritten") {
+TEST_CASE_FIXTURE(OnContent,
+                  "updating begins at the start of the file and keeps what is not overwritten") {
     CHECK(after(*this, "update put-NEW close") == "closed, mode 0, good: NEWtent");
 }
 
@@ -350,7 +429,7 @@ TEST_CASE_FIXTURE(OnFile, "a name reaches the system as UTF-8 and up to its firs
 }
 
 TEST_CASE_FIXTURE(OnFile,
-                  "a relative name belongs to the working directory, not the executable's") {
+                  "a relative name belongs to the working directory, not to the executable's") {
     CHECK(test::ending([&] {
               if (::chdir(dir.path().c_str()) != 0) return 1;
               File(L"relative.txt").open(WRITE);
@@ -402,7 +481,8 @@ TEST_CASE_FIXTURE(OnFile, "attempts that fail add the fail state") {
     }
 }
 
-TEST_CASE_FIXTURE(OnFile, "a file not opened can be opened later, and stays in the fail state") {
+TEST_CASE_FIXTURE(
+    OnFile, "a file that could not be opened can be opened later, and stays in the fail state") {
     CHECK(after(*this, "not-read store read") == "open, mode 1, fail: content");
     file.clear();
     CHECK(contentOf(file) == "content");
@@ -468,7 +548,8 @@ TEST_CASE_FIXTURE(OnContent, "close leaves the state of the stream as it was") {
     }
 }
 
-TEST_CASE_FIXTURE(OnFile, "closing a file never opened sets the fail state and no more") {
+TEST_CASE_FIXTURE(
+    OnFile, "closing a file that was never opened sets the fail state and touches nothing else") {
     CHECK(after(*this, "mode-write close") == "closed, mode 0, fail, no file");
     CHECK(after(*this, "store close") == "closed, mode 0, fail: content");
     CHECK(file.getName() == dir.wide("a"));
@@ -565,7 +646,8 @@ TEST_CASE_FIXTURE(OnRecorder, "synchronize leaves a closed file as it is") {
     CHECK(!isThere(path));
 }
 
-TEST_CASE_FIXTURE(OnRecorder, "synchronize opens in the mode that setMode left, here read-only") {
+TEST_CASE_FIXTURE(OnRecorder,
+                  "synchronize opens in the mode that setMode left, read-only for one") {
     recorder.File::open(UPDATE);
     recorder << "CON" << std::flush;
     recorder.setMode(READ);
