@@ -1,20 +1,20 @@
-// For whose sake the loader searches: it goes by who calls it, so nothing stands before its
+// For whose sake the loader searches: it goes by who calls it, so nothing comes before its
 // functions here. This executable has a DT_RUNPATH that finds the libraries beside it.
 #include <koru/dynamiclibrary.h>
 
 #include <dlfcn.h>
 
-#include <string>
-
 #include <doctest/doctest.h>
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-#define KORU_TEST_SANITIZED true // The sanitizer calls the loader then.
-#else
-#define KORU_TEST_SANITIZED false
-#endif
+using Koru::DynamicLibrary;
 
 namespace {
+
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr bool SANITIZED = true; // The sanitizer calls the loader then.
+#else
+constexpr bool SANITIZED = false;
+#endif
 
 /// Whether this executable may load it.
 bool isFoundFromHere(char const* name) {
@@ -25,15 +25,16 @@ bool isFoundFromHere(char const* name) {
 
 } // namespace
 
-TEST_CASE("the program's DT_RUNPATH is not used" * doctest::skip(KORU_TEST_SANITIZED)) {
-    Koru::DynamicLibrary library(L"libkoru_loadable_1.so");
+TEST_CASE("a name without a slash is not searched for in the program's own folders" *
+          doctest::skip(SANITIZED)) {
+    DynamicLibrary library(L"libkoru_loadable_1.so");
     CHECK(!library.load());
     CHECK(isFoundFromHere("libkoru_loadable_1.so"));
     CHECK(!library.load());
 }
 
-TEST_CASE("$ORIGIN is the folder of libkoru" * doctest::skip(KORU_TEST_SANITIZED)) {
-    CHECK(Koru::DynamicLibrary(L"$ORIGIN/libkoru.so.1").load());
-    CHECK(!Koru::DynamicLibrary(L"$ORIGIN/libkoru_loadable_1.so").load());
+TEST_CASE("$ORIGIN is the folder of libkoru" * doctest::skip(SANITIZED)) {
+    CHECK(DynamicLibrary(L"$ORIGIN/libkoru.so.1").load());
+    CHECK(!DynamicLibrary(L"$ORIGIN/libkoru_loadable_1.so").load());
     CHECK(isFoundFromHere("$ORIGIN/libkoru_loadable_1.so"));
 }
