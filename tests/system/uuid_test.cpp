@@ -2,7 +2,6 @@
 #include <koru/uuid.h>
 
 #include <algorithm>
-#include <array>
 #include <cstddef>
 #include <cstring>
 #include <iomanip>
@@ -15,25 +14,34 @@
 
 #include <doctest/doctest.h>
 
+using Bytes = std::vector<unsigned char>;
+using Koru::Uuid;
+
 namespace {
 
-using Bytes = std::vector<unsigned char>;
-
-Bytes bytesOf(Koru::Uuid const& uuid) { return uuid; }
-std::string textOf(Koru::Uuid const& uuid) { return uuid; }
-Bytes parsed(std::string const& text) { return bytesOf(Koru::Uuid(text)); }
-
-/// Bytes as a test's output and expectation show them: "01 23 ab".
+/// Bytes as a test's output and the expectations show them: "01 23 ab".
 std::string shown(Bytes const& bytes) {
-    static char const digits[] = "0123456789abcdef";
     std::string result;
     for (unsigned char const b : bytes) {
         if (!result.empty()) result += ' ';
-        result += digits[b >> 4];
-        result += digits[b & 15];
+        result += "0123456789abcdef"[b >> 4];
+        result += "0123456789abcdef"[b & 15];
     }
     return result;
 }
+
+} // namespace
+
+template <>
+struct doctest::StringMaker<Bytes> {
+    static String convert(Bytes const& bytes) { return shown(bytes).c_str(); }
+};
+
+namespace {
+
+Bytes bytesOf(Uuid const& uuid) { return uuid; }
+std::string textOf(Uuid const& uuid) { return uuid; }
+Bytes parsed(std::string const& text) { return Uuid(text); }
 
 Bytes const ZERO(16, 0);
 std::string const ZERO_TEXT = "00000000-0000-0000-0000-000000000000";
@@ -52,7 +60,7 @@ int digitValue(char c) {
 
 /// What a text is read as, in the plainest way: 36 characters up to the first NUL; a second copy of
 /// them with the hyphens taken out and, to make up for those, as many of the text's last characters
-/// put behind; all of that digits; 32 of it used.
+/// added; all of that digits; 32 of it used.
 Bytes modelOf(std::string const& stored) {
     std::string const text = stored.substr(0, stored.find('\0'));
     if (text.size() != 36) return ZERO;
@@ -60,142 +68,116 @@ Bytes modelOf(std::string const& stored) {
     for (char const c : text) {
         if (c != '-') buffer += c;
     }
-    std::size_t const hyphens = 36 - buffer.size();
-    buffer += text.substr(36 - hyphens);
+    buffer += text.substr(buffer.size());
     for (char const c : buffer) {
         if (digitValue(c) < 0) return ZERO;
     }
     Bytes bytes;
-    for (std::size_t i = 0; i < 16; ++i) {
-        int const value = digitValue(buffer[2 * i]) * 16 + digitValue(buffer[2 * i + 1]);
+    for (std::size_t i = 0; i < 32; i += 2) {
+        int const value = digitValue(buffer[i]) * 16 + digitValue(buffer[i + 1]);
         bytes.push_back(static_cast<unsigned char>(value));
     }
     return bytes;
 }
 
-/// The text of 16 bytes, written digit by digit.
-std::string modelText(Bytes const& bytes) {
+/// These bytes are written digit by digit, and read back from that.
+void checkBothWays(Bytes const& bytes) {
     std::string text;
     for (std::size_t i = 0; i < bytes.size(); ++i) {
         if (i == 4 || i == 6 || i == 8 || i == 10) text += '-';
         text += shown({bytes[i]});
     }
-    return text;
+    CHECK(textOf(Uuid(bytes)) == text);
+    CHECK(parsed(text) == bytes);
 }
 
-/// Numbers with a separator after each digit, as no locale writes them but some could.
-class SeparatingNumbers : public std::numpunct<char> {
-protected:
-    char do_thousands_sep() const override { return '.'; }
-    std::string do_grouping() const override { return "\1"; }
-};
-
-/// Sets the locale that new streams get, for a scope.
-class GlobalLocale {
-public:
-    explicit GlobalLocale(std::locale const& locale) : before_(std::locale::global(locale)) {}
-    GlobalLocale(GlobalLocale const&) = delete;
-    GlobalLocale& operator=(GlobalLocale const&) = delete;
-    ~GlobalLocale() { std::locale::global(before_); }
-
-private:
-    std::locale before_;
-};
+void checkAsModel(std::string const& text) {
+    CAPTURE(text);
+    CHECK(parsed(text) == modelOf(text));
+}
 
 } // namespace
 
-// ========================================================================================= shape
-
 TEST_CASE("an identifier is a plain value of 16 bytes") {
-    CHECK(sizeof(Koru::Uuid) == 16);
-    CHECK(alignof(Koru::Uuid) == 1);
-    CHECK(!std::is_polymorphic<Koru::Uuid>::value);
-    CHECK(std::is_trivially_copyable<Koru::Uuid>::value);
-    CHECK(std::is_standard_layout<Koru::Uuid>::value);
-    Koru::Uuid const uuid(BYTES);
+    CHECK(sizeof(Uuid) == 16);
+    CHECK(alignof(Uuid) == 1);
+    CHECK(!std::is_polymorphic_v<Uuid>);
+    CHECK(std::is_trivially_copyable_v<Uuid>);
+    CHECK(std::is_standard_layout_v<Uuid>);
+    Uuid const uuid(BYTES);
     CHECK(std::memcmp(&uuid, BYTES, sizeof uuid) == 0);
 }
 
 TEST_CASE("an identifier is made from nothing, 16 bytes, a vector or text") {
-    CHECK(std::is_default_constructible<Koru::Uuid>::value);
-    CHECK(std::is_constructible<Koru::Uuid, unsigned char const(&)[16]>::value);
-    CHECK(std::is_constructible<Koru::Uuid, unsigned char(&)[16]>::value);
-    CHECK(std::is_constructible<Koru::Uuid, Bytes>::value);
-    CHECK(std::is_constructible<Koru::Uuid, std::string>::value);
-    CHECK(!std::is_constructible<Koru::Uuid, unsigned char const(&)[15]>::value);
-    CHECK(!std::is_constructible<Koru::Uuid, unsigned char const(&)[17]>::value);
-    CHECK(!std::is_constructible<Koru::Uuid, std::wstring>::value);
+    CHECK(std::is_default_constructible_v<Uuid>);
+    CHECK(std::is_constructible_v<Uuid, unsigned char const(&)[16]>);
+    CHECK(std::is_constructible_v<Uuid, unsigned char(&)[16]>);
+    CHECK(std::is_constructible_v<Uuid, Bytes>);
+    CHECK(std::is_constructible_v<Uuid, std::string>);
+    CHECK(!std::is_constructible_v<Uuid, unsigned char const(&)[15]>);
+    CHECK(!std::is_constructible_v<Uuid, unsigned char const(&)[17]>);
+    CHECK(!std::is_constructible_v<Uuid, std::wstring>);
 }
 
 TEST_CASE("a default identifier is all zero") {
-    Koru::Uuid const uuid;
-    CHECK(shown(bytesOf(uuid)) == shown(ZERO));
-    CHECK(textOf(uuid) == ZERO_TEXT);
+    CHECK(bytesOf(Uuid()) == ZERO);
+    CHECK(textOf(Uuid()) == ZERO_TEXT);
 }
 
 TEST_CASE("a copy has the bytes of the original and a life of its own") {
-    Koru::Uuid original(BYTES);
-    Koru::Uuid const copy(original);
-    Koru::Uuid assigned;
+    Uuid original(BYTES);
+    Uuid const copy(original);
+    Uuid assigned;
     assigned = original;
-    original = Koru::Uuid();
-    CHECK(shown(bytesOf(copy)) == shown(VECTOR));
-    CHECK(shown(bytesOf(assigned)) == shown(VECTOR));
-    CHECK(shown(bytesOf(original)) == shown(ZERO));
-    Koru::Uuid& self = assigned;
+    original = Uuid();
+    CHECK(bytesOf(copy) == VECTOR);
+    CHECK(bytesOf(assigned) == VECTOR);
+    CHECK(bytesOf(original) == ZERO);
+    Uuid& self = assigned;
     assigned = self;
-    CHECK(shown(bytesOf(assigned)) == shown(VECTOR));
+    CHECK(bytesOf(assigned) == VECTOR);
 }
 
-// ========================================================================================= bytes
-
 TEST_CASE("16 bytes are kept in the order given") {
-    CHECK(shown(bytesOf(Koru::Uuid(BYTES))) == shown(VECTOR));
+    CHECK(bytesOf(Uuid(BYTES)) == VECTOR);
     unsigned char all[16];
     for (unsigned i = 0; i < 16; ++i) all[i] = static_cast<unsigned char>(0xF0 + i);
-    CHECK(shown(bytesOf(Koru::Uuid(all))) == "f0 f1 f2 f3 f4 f5 f6 f7 f8 f9 fa fb fc fd fe ff");
+    CHECK(shown(Uuid(all)) == "f0 f1 f2 f3 f4 f5 f6 f7 f8 f9 fa fb fc fd fe ff");
 }
 
 TEST_CASE("an identifier does not change with the array or the vector it was made from") {
     unsigned char array[16];
     std::copy(VECTOR.begin(), VECTOR.end(), array);
     Bytes vector = VECTOR;
-    Koru::Uuid const fromArray(array);
-    Koru::Uuid const fromVector(vector);
+    Uuid const fromArray(array);
+    Uuid const fromVector(vector);
     std::fill(array, array + 16, static_cast<unsigned char>(0xEE));
     std::fill(vector.begin(), vector.end(), static_cast<unsigned char>(0xEE));
-    CHECK(shown(bytesOf(fromArray)) == shown(VECTOR));
-    CHECK(shown(bytesOf(fromVector)) == shown(VECTOR));
+    CHECK(bytesOf(fromArray) == VECTOR);
+    CHECK(bytesOf(fromVector) == VECTOR);
 }
 
 TEST_CASE("a vector of any size but 16 gives the identifier of zeros") {
     for (std::size_t size = 0; size <= 40; ++size) {
         CAPTURE(size);
         Bytes const bytes(size, 0xA5);
-        Bytes const expected = size == 16 ? bytes : ZERO;
-        CHECK(shown(bytesOf(Koru::Uuid(bytes))) == shown(expected));
+        CHECK(bytesOf(Uuid(bytes)) == (size == 16 ? bytes : ZERO));
     }
-    CHECK(shown(bytesOf(Koru::Uuid(Bytes(1U << 16, 1)))) == shown(ZERO));
+    CHECK(bytesOf(Uuid(Bytes(1U << 16, 1))) == ZERO);
 }
 
 TEST_CASE("the vector of an identifier is new each time and always of 16 bytes") {
-    for (Koru::Uuid const& uuid : {Koru::Uuid(), Koru::Uuid(BYTES), Koru::Uuid(Bytes(17, 1))}) {
+    for (Uuid const& uuid : {Uuid(), Uuid(BYTES), Uuid(Bytes(17, 1))})
         CHECK(bytesOf(uuid).size() == 16);
-    }
-    Koru::Uuid const uuid(BYTES);
-    Bytes first = uuid;
-    first[0] = 0xFF;
-    first.clear();
-    CHECK(shown(bytesOf(uuid)) == shown(VECTOR));
+    Uuid const uuid(BYTES);
+    bytesOf(uuid).clear();
+    CHECK(bytesOf(uuid) == VECTOR);
 }
 
-// ========================================================================================= text
-// out
-
 TEST_CASE("the text has groups of 8, 4, 4, 4 and 12 lower-case digits in the order of the bytes") {
-    CHECK(textOf(Koru::Uuid(BYTES)) == TEXT);
-    CHECK(textOf(Koru::Uuid(Bytes(16, 0xFF))) == "ffffffff-ffff-ffff-ffff-ffffffffffff");
-    CHECK(textOf(Koru::Uuid(Bytes(16, 0x0A))) == "0a0a0a0a-0a0a-0a0a-0a0a-0a0a0a0a0a0a");
+    CHECK(textOf(Uuid(BYTES)) == TEXT);
+    CHECK(textOf(Uuid(Bytes(16, 0xFF))) == "ffffffff-ffff-ffff-ffff-ffffffffffff");
+    CHECK(textOf(Uuid(Bytes(16, 0x0A))) == "0a0a0a0a-0a0a-0a0a-0a0a-0a0a0a0a0a0a");
 }
 
 TEST_CASE("every value of every byte is two digits of the text") {
@@ -203,32 +185,30 @@ TEST_CASE("every value of every byte is two digits of the text") {
         for (unsigned value = 0; value < 256; ++value) {
             Bytes bytes = ZERO;
             bytes[at] = static_cast<unsigned char>(value);
-            std::string const text = textOf(Koru::Uuid(bytes));
-            bool const same = text == modelText(bytes) && parsed(text) == bytes;
-            if (same) continue;
-            CAPTURE(at);
-            CAPTURE(value);
-            CHECK(text == modelText(bytes));
-            CHECK(shown(parsed(text)) == shown(bytes));
+            checkBothWays(bytes);
         }
     }
 }
 
 TEST_CASE("the text is the same when streams are given a locale that separates digits") {
-    GlobalLocale const global(std::locale(std::locale::classic(), new SeparatingNumbers));
+    struct SeparatingNumbers : std::numpunct<char> {
+        char do_thousands_sep() const override { return '.'; }
+        std::string do_grouping() const override { return "\1"; }
+    };
+    std::locale const before =
+        std::locale::global(std::locale(std::locale::classic(), new SeparatingNumbers));
     std::ostringstream separated;
     separated << 1234;
-    REQUIRE(separated.str() == "1.2.3.4");
-    CHECK(textOf(Koru::Uuid(BYTES)) == TEXT);
-    CHECK(shown(parsed(TEXT)) == shown(VECTOR));
+    CHECK(separated.str() == "1.2.3.4");
+    CHECK(textOf(Uuid(BYTES)) == TEXT);
+    CHECK(parsed(TEXT) == VECTOR);
+    std::locale::global(before);
 }
-
-// ========================================================================================= text in
 
 TEST_CASE("text is read with upper and lower case digits and hyphens anywhere but near the end") {
     struct Row {
         char const* label;
-        char const* text;
+        std::string text;
     };
     Row const rows[] = {
         {"as it is written", "0123abcd-4567-89ab-cdef-0123456789ab"},
@@ -245,33 +225,30 @@ TEST_CASE("text is read with upper and lower case digits and hyphens anywhere bu
     };
     for (Row const& row : rows) {
         CAPTURE(row.label);
-        CHECK(shown(parsed(row.text)) == shown(VECTOR));
-        CHECK(textOf(Koru::Uuid(std::string(row.text))) == TEXT);
+        CHECK(parsed(row.text) == VECTOR);
+        CHECK(textOf(Uuid(row.text)) == TEXT);
     }
 }
 
 TEST_CASE("with more than four hyphens the last digits are read twice") {
     struct Row {
-        int hyphens;
-        char const* digits;
+        char const* label;
+        char const* text;
         char const* expected;
     };
     Row const rows[] = {
-        // 31 digits, and of the last five repeated the first is used
-        {5, "0123456789abcdef0123456789abcde", "01 23 45 67 89 ab cd ef 01 23 45 67 89 ab cd ea"},
-        // 30 digits, and of the last six repeated two are used
-        {6, "0123456789abcdef0123456789abcd", "01 23 45 67 89 ab cd ef 01 23 45 67 89 ab cd 89"},
-        // 19 digits, and 13 of the last 17
-        {17, "0123456789abcdef012", "01 23 45 67 89 ab cd ef 01 22 34 56 78 9a bc de"},
-        // half of it hyphens: 18 digits, and 14 of them once more
-        {18, "0123456789abcdef01", "01 23 45 67 89 ab cd ef 01 01 23 45 67 89 ab cd"},
+        {"31 digits, and of the last five repeated the first is used",
+         "-----0123456789abcdef0123456789abcde", "01 23 45 67 89 ab cd ef 01 23 45 67 89 ab cd ea"},
+        {"30 digits, and of the last six repeated two are used",
+         "------0123456789abcdef0123456789abcd", "01 23 45 67 89 ab cd ef 01 23 45 67 89 ab cd 89"},
+        {"19 digits, and 13 of the last 17", "-----------------0123456789abcdef012",
+         "01 23 45 67 89 ab cd ef 01 22 34 56 78 9a bc de"},
+        {"half of it hyphens: 18 digits, and 14 of them once more",
+         "------------------0123456789abcdef01", "01 23 45 67 89 ab cd ef 01 01 23 45 67 89 ab cd"},
     };
     for (Row const& row : rows) {
-        CAPTURE(row.hyphens);
-        std::string const text =
-            std::string(static_cast<std::size_t>(row.hyphens), '-') + row.digits;
-        REQUIRE(text.size() == 36);
-        CHECK(shown(parsed(text)) == row.expected);
+        CAPTURE(row.label);
+        CHECK(shown(parsed(row.text)) == row.expected);
     }
 }
 
@@ -281,10 +258,9 @@ TEST_CASE("text with a hyphen among the last characters is refused, counted as i
         // Of a run of k hyphens none is among the last k characters when it ends k before the end.
         for (std::size_t after = 0; after + hyphens <= 36; ++after) {
             CAPTURE(after);
-            std::string const text = std::string(36 - hyphens - after, 'a') +
-                                     std::string(hyphens, '-') + std::string(after, 'a');
-            Bytes const expected = after >= hyphens ? Bytes(16, 0xAA) : ZERO;
-            CHECK(shown(parsed(text)) == shown(expected));
+            std::string text(36, 'a');
+            text.replace(36 - hyphens - after, hyphens, hyphens, '-');
+            CHECK(parsed(text) == (after >= hyphens ? Bytes(16, 0xAA) : ZERO));
         }
     }
 }
@@ -292,60 +268,58 @@ TEST_CASE("text with a hyphen among the last characters is refused, counted as i
 TEST_CASE("text of any length but 36 is refused") {
     for (std::size_t size = 0; size <= 80; ++size) {
         CAPTURE(size);
-        Bytes const expected = size == 36 ? Bytes(16, 0x77) : ZERO;
-        CHECK(shown(parsed(std::string(size, '7'))) == shown(expected));
+        CHECK(parsed(std::string(size, '7')) == (size == 36 ? Bytes(16, 0x77) : ZERO));
     }
-    CHECK(shown(parsed("")) == shown(ZERO));
-    CHECK(shown(parsed("{" + TEXT + "}")) == shown(ZERO));
-    CHECK(shown(parsed("urn:uuid:" + TEXT)) == shown(ZERO));
-    CHECK(shown(parsed(TEXT + "\n")) == shown(ZERO));
-    CHECK(shown(parsed(" " + TEXT)) == shown(ZERO));
-    CHECK(shown(parsed("0123abcd456789abcdef0123456789ab")) == shown(ZERO)); // 32 digits
-    CHECK(shown(parsed(std::string(36 + 256, '7'))) == shown(ZERO));
-    CHECK(shown(parsed(std::string(36 + 65536, '7'))) == shown(ZERO));
+    for (std::string const& text :
+         {std::string(), "{" + TEXT + "}", "urn:uuid:" + TEXT, TEXT + "\n", " " + TEXT,
+          std::string("0123abcd456789abcdef0123456789ab"), std::string(36 + 256, '7'),
+          std::string(36 + 65536, '7')}) {
+        CAPTURE(text);
+        CHECK(parsed(text) == ZERO);
+    }
 }
 
 TEST_CASE("text ends at its first NUL") {
     std::string const nul(1, '\0');
-    CHECK(shown(parsed(TEXT + nul)) == shown(VECTOR));
-    CHECK(shown(parsed(TEXT + nul + "and more")) == shown(VECTOR));
-    CHECK(shown(parsed(nul + TEXT)) == shown(ZERO));
-    CHECK(shown(parsed(nul)) == shown(ZERO));
+    CHECK(parsed(TEXT + nul) == VECTOR);
+    CHECK(parsed(TEXT + nul + "and more") == VECTOR);
+    CHECK(parsed(nul + TEXT) == ZERO);
+    CHECK(parsed(nul) == ZERO);
     for (std::size_t at = 0; at < 36; ++at) {
         CAPTURE(at);
         std::string text(36, 'b');
         text[at] = '\0';
-        CHECK(shown(parsed(text)) == shown(ZERO));
-        CHECK(shown(parsed(text + std::string(36, 'b'))) == shown(ZERO));
+        CHECK(parsed(text) == ZERO);
+        CHECK(parsed(text + std::string(36, 'b')) == ZERO);
     }
 }
 
 TEST_CASE("any character but digits and hyphens is refused, wherever it stands") {
-    std::string const noHyphens(36, 'c');
     for (std::size_t at = 0; at < 36; ++at) {
+        CAPTURE(at);
         for (int value = 1; value < 256; ++value) {
+            CAPTURE(value);
             char const c = static_cast<char>(value);
             if (c == '-' || digitValue(c) >= 0) continue;
-            bool refused = true;
-            for (std::string text : {TEXT, noHyphens}) {
+            for (std::string text : {TEXT, std::string(36, 'c')}) {
                 text[at] = c;
-                refused = refused && parsed(text) == ZERO;
+                CHECK(parsed(text) == ZERO);
             }
-            if (refused) continue;
-            CAPTURE(at);
-            CAPTURE(value);
-            CHECK(refused);
         }
     }
 }
 
 TEST_CASE("a refused text leaves nothing of itself behind") {
-    // The last character decides, after 35 good ones.
-    CHECK(shown(parsed("0123abcd-4567-89ab-cdef-0123456789aG")) == shown(ZERO));
-    CHECK(shown(parsed("0123abcd456789abcdef0123456789ab012x")) == shown(ZERO));
-    CHECK(shown(parsed("0x23abcd-4567-89ab-cdef-0123456789ab")) == shown(ZERO));
-    CHECK(shown(parsed("+123abcd-4567-89ab-cdef-0123456789ab")) == shown(ZERO));
-    CHECK(shown(parsed(" 123abcd-4567-89ab-cdef-0123456789ab")) == shown(ZERO));
+    for (char const* text : {
+             "0123abcd-4567-89ab-cdef-0123456789aG", // the last of them decides
+             "0123abcd456789abcdef0123456789ab012x",
+             "0x23abcd-4567-89ab-cdef-0123456789ab",
+             "+123abcd-4567-89ab-cdef-0123456789ab",
+             " 123abcd-4567-89ab-cdef-0123456789ab",
+         }) {
+        CAPTURE(text);
+        CHECK(parsed(text) == ZERO);
+    }
 }
 
 TEST_CASE("text is read as a plain model reads it") {
@@ -366,13 +340,8 @@ TEST_CASE("text is read as a plain model reads it") {
             if (below(8) == 0) text[below(size)] = others[below(others.size())];
         }
         if (below(16) == 0) text += std::string("\0tail", below(6));
-        Bytes const expected = modelOf(text);
-        Bytes const actual = parsed(text);
-        if (expected != ZERO) ++accepted;
-        if (actual == expected) continue;
-        CAPTURE(round);
-        CAPTURE(text);
-        CHECK(shown(actual) == shown(expected));
+        if (modelOf(text) != ZERO) ++accepted;
+        checkAsModel(text);
     }
     CHECK(accepted > 10000);
     CHECK(accepted < 50000);
@@ -380,24 +349,19 @@ TEST_CASE("text is read as a plain model reads it") {
 
 TEST_CASE("the usual form with any character in it, and any two, is read as the model reads it") {
     std::string const odd = std::string("\0", 1) + "-0/9:@AFG`afg\x10\x19\x7f\x80\xb0\xe1\xff";
-    auto const check = [](std::string const& text) {
-        if (parsed(text) == modelOf(text)) return;
-        CAPTURE(text);
-        CHECK(shown(parsed(text)) == shown(modelOf(text)));
-    };
     for (std::size_t at = 0; at < 36; ++at) {
         std::string text = TEXT;
         for (int value = 0; value < 256; ++value) {
             text[at] = static_cast<char>(value);
-            check(text);
+            checkAsModel(text);
         }
         for (std::size_t other = at + 1; other < 36; ++other) {
+            text = TEXT;
             for (char const x : odd) {
                 for (char const y : odd) {
-                    text = TEXT;
                     text[at] = x;
                     text[other] = y;
-                    check(text);
+                    checkAsModel(text);
                 }
             }
         }
@@ -409,28 +373,22 @@ TEST_CASE("16 bytes survive the way through the text and back") {
     for (int round = 0; round < 5000; ++round) {
         Bytes bytes;
         for (int i = 0; i < 16; ++i) bytes.push_back(static_cast<unsigned char>(random() & 0xFF));
-        std::string const text = textOf(Koru::Uuid(bytes));
-        if (text == modelText(bytes) && parsed(text) == bytes) continue;
-        CHECK(text == modelText(bytes));
-        CHECK(shown(parsed(text)) == shown(bytes));
+        checkBothWays(bytes);
     }
 }
 
-// =========================================================================================
-// equality
-
 TEST_CASE("identifiers are equal exactly when all their bits are") {
-    Koru::Uuid const uuid(BYTES);
+    Uuid const uuid(BYTES);
     CHECK(uuid == uuid);
-    CHECK(uuid == Koru::Uuid(BYTES));
-    CHECK(!(uuid != Koru::Uuid(BYTES)));
-    CHECK(uuid == Koru::Uuid(TEXT));
-    CHECK(Koru::Uuid() == Koru::Uuid(ZERO_TEXT));
+    CHECK(uuid == Uuid(BYTES));
+    CHECK(!(uuid != Uuid(BYTES)));
+    CHECK(uuid == Uuid(TEXT));
+    CHECK(Uuid() == Uuid(ZERO_TEXT));
     for (unsigned bit = 0; bit < 128; ++bit) {
         CAPTURE(bit);
         Bytes bytes = VECTOR;
         bytes[bit / 8] = static_cast<unsigned char>(bytes[bit / 8] ^ (1U << bit % 8));
-        Koru::Uuid const other(bytes);
+        Uuid const other(bytes);
         CHECK(!(uuid == other));
         CHECK(!(other == uuid));
         CHECK(uuid != other);
@@ -439,39 +397,31 @@ TEST_CASE("identifiers are equal exactly when all their bits are") {
 }
 
 TEST_CASE("a refused text cannot be told from the text of the default identifier") {
-    CHECK(Koru::Uuid(std::string("nonsense")) == Koru::Uuid(ZERO_TEXT));
+    CHECK(Uuid(std::string("nonsense")) == Uuid(ZERO_TEXT));
 }
-
-// ========================================================================================= streams
 
 TEST_CASE("the inserter writes the text and returns the stream") {
     std::ostringstream out;
-    std::ostream& returned = out << Koru::Uuid(BYTES);
+    std::ostream& returned = out << Uuid(BYTES);
     CHECK(&returned == &out);
-    out << '|' << Koru::Uuid();
+    out << '|' << Uuid();
     CHECK(out.str() == TEXT + "|" + ZERO_TEXT);
 }
 
 TEST_CASE("width and fill go to the first character, before or behind it") {
     std::ostringstream out;
-    out << std::setw(5) << std::setfill('*') << Koru::Uuid(BYTES);
-    CHECK(out.str() == "****" + TEXT);
+    out << std::setw(5) << std::setfill('*') << Uuid(BYTES);
     CHECK(out.width() == 0);
-
-    std::ostringstream left;
-    left << std::left << std::setw(5) << std::setfill('*') << Koru::Uuid(BYTES);
-    CHECK(left.str() == "0****" + TEXT.substr(1));
-
-    std::ostringstream wide;
-    wide << std::setw(40) << Koru::Uuid(BYTES);
-    CHECK(wide.str() == std::string(39, ' ') + TEXT);
+    out << std::left << std::setw(5) << Uuid(BYTES);
+    out << std::right << std::setw(40) << std::setfill(' ') << Uuid(BYTES);
+    CHECK(out.str() == "****" + TEXT + "0****" + TEXT.substr(1) + std::string(39, ' ') + TEXT);
 }
 
 TEST_CASE("the inserter takes no notice of the stream's number format and leaves it alone") {
     std::ostringstream out;
     out << std::oct << std::uppercase << std::showbase << std::setfill('#');
     std::ios_base::fmtflags const flags = out.flags();
-    out << Koru::Uuid(BYTES);
+    out << Uuid(BYTES);
     CHECK(out.str() == TEXT);
     CHECK(out.flags() == flags);
     CHECK(out.fill() == '#');
@@ -480,7 +430,7 @@ TEST_CASE("the inserter takes no notice of the stream's number format and leaves
 TEST_CASE("nothing is written to a stream that has failed") {
     std::ostringstream out;
     out.setstate(std::ios_base::failbit);
-    out << Koru::Uuid(BYTES);
+    out << Uuid(BYTES);
     CHECK(out.str().empty());
     CHECK(out.fail());
 }
