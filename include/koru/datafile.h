@@ -15,23 +15,28 @@ namespace Koru {
 class RecordSet;
 
 /// A file of records, each a wide key with bytes of data. `open` reads the whole file into memory,
-/// every other operation works on the records held, and `close` or the destructor writes them back
-/// when the file was opened for writing.
+/// every other operation works on the records there, and `close` or the destructor writes them back
+/// when the file was opened for writing:
+/// @code
+///     Koru::DataFile users("users.dat"); // beside the executable
+///     users.open(Koru::File::READ | Koru::File::WRITE);
+///     users.insert(Koru::DataFile::Record(L"ann", {0x01, 0x02}));
+/// @endcode
 ///
-/// Intended: records stand in the order of their addresses in memory, neither by key nor by
-/// insertion, and a record's position may change with every `open`. Keys are compared without
-/// regard to case (`compare` of <koru/string.h>, up to the first NUL, under the current C locale).
+/// Intended: records are in the order of their addresses in memory, neither by key nor by
+/// insertion, and a record's position may change with every `open`. Keys compare without regard to
+/// case (`compare` of <koru/string.h>, up to the first NUL, under the current C locale).
 ///
 /// The format, all numbers little-endian: for each record the length K of the key in bytes (32
-/// bits), K bytes of key, the length D of the data (32 bits), D bytes of data. A key takes two
-/// bytes a character: zero, then the low 8 bits of the character.
+/// bits), K bytes of key, the length D of the data (32 bits), D bytes of data. A key has two bytes
+/// for each character: zero, then the low 8 bits of the character.
 /// Intended: characters above U+00FF lose their high bits, and 0x80 to 0xFF read back as 0xFFFFFF80
-/// to 0xFFFFFFFF. Only keys of 0x00 to 0x7F survive.
+/// to 0xFFFFFFFF. Only characters from 0x00 to 0x7F survive.
 ///
-/// Every operation but construction and destruction holds the file's lock from its beginning to its
-/// end, so one object may be used by several threads at once, save for the references that
-/// `operator[]` gives. All operations may throw `std::bad_alloc`. A thread that is cancelled in
-/// `open` leaves the mode 0: nothing is written.
+/// Every operation except construction and destruction holds the file's lock from beginning to end,
+/// so several threads may use one object at once, except for the references that `operator[]`
+/// gives. Every operation may throw `std::bad_alloc`. A thread that is cancelled in `open` leaves
+/// the mode 0, so that nothing is written.
 class KORU_EXPORT DataFile : public File {
 public:
     class Record;
@@ -42,81 +47,87 @@ public:
     /// A closed file without records.
     DataFile(File::Path const& path);
 
+    /// Not copyable, as no stream is.
     DataFile(DataFile const&) = delete;
     DataFile& operator=(DataFile const&) = delete;
 
-    /// Does what `close` does if the file is open. What goes wrong is lost; call `close` first to
-    /// see it.
+    /// Does what `close` does if the file is open. Failures are lost; to see them, call
+    /// `close` before.
     ~DataFile() override;
 
     /// Opens the file as `File::open` does, with `BINARY` added to the mode, and replaces the
-    /// records: with `READ` by those of the file, otherwise by none. Entries with equal keys are
-    /// all held.
+    /// records: with `READ`, by those of the file, all of those with equal keys; otherwise by none.
     /// @throws std::runtime_error "failed to open file."; the records are unchanged
     /// @throws std::runtime_error "failed to read from file" for an entry that is cut short or
     ///         claims to be longer than the file, and where reading fails; std::invalid_argument
     ///         "zero length key" for an entry without a key; on 32 bits std::bad_alloc for a length
-    ///         of 2 GiB or more. The file is open then, the entries before that one are held, and
-    ///         with `WRITE` the destructor writes those: `setMode(0)` first.
+    ///         of 2 GiB or more. The file is open then and the entries before that one are held;
+    ///         with `WRITE` the destructor writes those unless you call `setMode(0)` before.
     void open(unsigned long mode) override;
-    /// As in `File`: no stream's open mode.
+    /// Refuses a stream's open mode, as `File` does.
     void open(std::ios_base::openmode) = delete;
 
-    /// When the mode has `WRITE`: deletes the file and writes all records to a new one. In any case
-    /// destroys the records and closes the file. Without `WRITE` changes are lost silently. What
-    /// only close(2) finds, such as a quota, is in `fail()` and not thrown. Cancellation is held
-    /// off.
+    /// If the mode has `WRITE`, deletes the file and writes all records to a new one. In any case
+    /// destroys the records and closes the file; without `WRITE`, changes are lost silently. An
+    /// error that only close(2) reports, such as a quota, shows in `fail()` and throws nothing.
+    /// Holds cancellation off.
     /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
-    ///         written, the records are held
-    /// @throws std::runtime_error "failed to open file."; the mode is 0 then and the records held:
+    ///         written, the records intact
+    /// @throws std::runtime_error "failed to open file."; the mode is 0 then, the records intact:
     ///         `setMode` and another `close` try again. The file is gone or empty; or as it was, if
     ///         neither was possible; or the new one, if it could be written without a stream.
     /// @throws std::runtime_error "failed to close file."
     void close() override;
 
-    /// The number of records held.
+    /// The number of records.
     unsigned long size() const;
 
-    /// The record at a position from 0, for reading and changing. The reference is valid until the
-    /// record is removed, or the file opened or closed; using it is not guarded by the lock. A key
-    /// that is changed through it is not compared with those of other records.
+    /// The record at a position, counted from 0, to read and change. The reference is valid until
+    /// the record is removed or the file opened or closed; the lock does not guard its use. A key
+    /// changed through it is not compared with the keys of other records.
     /// @throws std::out_of_range "object does not exist"
     Record& operator[](unsigned long index);
 
-    /// Holds a copy of the record, unless one with an equal key is held: then nothing happens.
+    /// Adds a copy of the record; does nothing when there is a record with an equal key.
     void insert(Record const& record);
 
-    /// Destroys the first record whose key equals this one's; nothing happens without one.
+    /// Destroys the first record whose key equals this one's, if there is one.
     void remove(Record const& record);
 
 private:
     std::unique_ptr<RecordSet> records_;
 };
 
-/// A key and data. A plain value: distinct objects may be used from several threads at once.
+/// A key and data. A plain value: several threads may use distinct objects at once.
 class KORU_EXPORT DataFile::Record {
 public:
     /// Key and data empty.
     Record();
 
+    /// Key, trimmed as by `setKey`, and data.
     /// @throws std::invalid_argument "zero length key", as `setKey`
     Record(std::wstring const& key, std::vector<unsigned char> const& data);
 
+    /// Copies key and data.
     Record(Record const& other);
     Record& operator=(Record const& other);
+
+    /// Virtual, so that derived records can be deleted through a pointer to this class.
     virtual ~Record();
 
-    /// The key, valid as long as the record and until `setKey`.
+    /// The key; the reference is valid as long as the record and until `setKey`.
     virtual std::wstring const& getKey() const;
 
-    /// Sets the key, without the blanks, tabs and line feeds at its ends. A key of nothing else is
-    /// kept as it is.
+    /// Sets the key, without the blanks, tabs and line feeds at its ends; a key of nothing else
+    /// stays as it is.
     /// @throws std::invalid_argument "zero length key" when what remains is empty or begins with
     ///         NUL; the record is unchanged
     virtual void setKey(std::wstring const& key);
 
-    /// The data, valid as long as the record and until `setData`.
+    /// The data; the reference is valid as long as the record and until `setData`.
     virtual std::vector<unsigned char> const& getData() const;
+
+    /// Sets the data.
     virtual void setData(std::vector<unsigned char> const& data);
 
 private:

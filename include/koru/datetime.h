@@ -14,20 +14,25 @@
 
 namespace Koru {
 
-/// A calendar date, a time of day with milliseconds and an offset from UTC, and a mask that says
-/// which of the two halves the value carries. A plain value.
+/// A calendar date, a time of day with milliseconds, an offset from UTC, and a mask that says which
+/// of the two halves, date and time, the value has. A plain value:
+/// @code
+///     Koru::DateTime const start("2005-07-07 11:05:00");
+///     long const seconds = start; // since the epoch, 1120734300 in UTC
+///     std::string const later = Koru::DateTime(seconds + 3600); // "2005-07-07 12:05:00"
+/// @endcode
 ///
-/// Construction from a `tm`, a `long` or a `timeval`, conversion to `long`, and with it some
-/// comparisons, use `localtime`, `gmtime` and `mktime` (POSIX), which share static storage: threads
-/// that do so at once serialise it. Everything else may be done from several threads at once.
+/// Construction from a `tm`, a `long` or a `timeval`, conversion to `long`, and thus some
+/// comparisons use `localtime`, `gmtime` and `mktime` (POSIX), which share static storage: threads
+/// have to take turns with these. Several threads may do everything else at once.
 ///
-/// Intended: the offset takes part in nothing. Constructors derive it in whole hours, without the
-/// hour of daylight saving; `setOffset` takes minutes.
+/// Intended: nothing uses the offset. Constructors derive it in whole hours, without the hour of
+/// daylight saving; `setOffset` takes minutes.
 class KORU_EXPORT DateTime {
 public:
-    /// Parts, combined with `|`: year, month and day; hour, minute, second, millisecond and offset.
-    static unsigned int const DATE = 1U;
-    static unsigned int const TIME = 2U;
+    /// Parts, combined with `|`.
+    static unsigned int const DATE = 1U; ///< year, month and day
+    static unsigned int const TIME = 2U; ///< hour, minute, second, millisecond and offset
 
     /// All fields 0, with both parts.
     DateTime();
@@ -43,8 +48,9 @@ public:
     DateTime(timeval const& time, unsigned int parts = DATE | TIME);
 
     /// Reads the given parts of "YYYY-MM-DD HH:MM:SS", "YYYY-MM-DD" or, for `TIME` alone,
-    /// "HH:MM:SS". Intended: what stands behind the date's place is not looked at, numbers are read
-    /// as `strtol` reads them, and of a date's numbers 0 or none at all leaves the field 0.
+    /// "HH:MM:SS". Intended: it ignores the character between date and time and all that follows
+    /// the last part, reads numbers as `strtol` does, and leaves a field of the date 0 where the
+    /// number is 0 or missing.
     /// @throws std::invalid_argument "incorrect format.", and what the setters throw
     DateTime(std::string const& text, unsigned int parts = DATE | TIME);
 
@@ -58,8 +64,8 @@ public:
     std::int16_t getOffset() const;       ///< hours or minutes, see above
 
     /// @name Setters
-    /// Each checks and sets one field; a value that is refused leaves the object as it was. The day
-    /// is not checked against the month.
+    /// Each checks and sets one field; when it refuses a value, the object is as it was. Nothing
+    /// checks the day against the month.
     /// @{
 
     /// @throws std::invalid_argument "year out-of-range" unless 1000 to 3000
@@ -75,21 +81,21 @@ public:
     /// @throws std::invalid_argument "minute out-of-range." (Intended: the minute's message) unless
     ///         0 to 59
     void setSecond(unsigned char second);
-    /// Any number.
+    /// Takes any number.
     void setMillisecond(unsigned int millisecond);
     /// @throws std::invalid_argument "offset out-of-range." unless -720 to 840 minutes
     void setOffset(short offset);
 
     /// @}
 
-    /// Sets the fields of the given parts to 0. The value still carries the parts it carried.
+    /// Sets the fields of the given parts to 0. The value keeps the parts that it had.
     void clear(unsigned int parts);
 
-    /// Seconds since the epoch of the fields as local time, daylight saving as the C library finds
-    /// it; -1 where `mktime` fails. A year of 0 counts as 1900, a month of 0 as January.
+    /// The seconds since the epoch for the fields as local time, with daylight saving as the C
+    /// library finds it; -1 if `mktime` fails. A year of 0 counts as 1900, a month of 0 as January.
     operator long() const;
 
-    /// "YYYY-MM-DD HH:MM:SS" or the half that the value carries; empty when it carries none.
+    /// "YYYY-MM-DD HH:MM:SS", or the half of it that the value has; empty when it has none.
     operator std::string() const;
 
     friend KORU_EXPORT std::ostream& operator<<(std::ostream& os, DateTime const& value);
@@ -106,7 +112,8 @@ private:
     std::uint8_t parts_;
 };
 
-/// Compare the epoch seconds of both values. Milliseconds, offset and parts play no part.
+/// Compares the seconds since the epoch of both values; milliseconds, offset and parts do
+/// not count.
 KORU_EXPORT bool operator==(DateTime const& a, DateTime const& b);
 KORU_EXPORT bool operator!=(DateTime const& a, DateTime const& b);
 KORU_EXPORT bool operator<(DateTime const& a, DateTime const& b);

@@ -10,50 +10,51 @@
 namespace Koru {
 
 /// A shared library that is loaded on request (`dlopen`, POSIX) and unloaded at the latest when the
-/// object is destroyed. Each object owns at most one handle. The object has no lock: threads that
-/// share one guard it. Nothing is thrown, apart from `std::bad_alloc`; why loading failed is not
-/// kept, but `dlerror` tells right after a failed `load`.
+/// object is destroyed. Each object owns at most one handle. It has no lock: threads that share an
+/// object guard it themselves. The operations throw nothing but `std::bad_alloc`. The object does
+/// not keep the reason of a failure; `dlerror` tells it right after a failed `load`.
 class KORU_EXPORT DynamicLibrary {
 public:
     /// Not loaded, with an empty name.
     DynamicLibrary();
 
-    /// Not loaded. The name is given to the loader as UTF-8 and otherwise unchanged: one without a
-    /// slash is searched for as the loader does, a relative path counts from the working directory.
-    /// The loader searches for libkoru's sake: the program's DT_RUNPATH is not used (DT_RPATH and
-    /// LD_LIBRARY_PATH are), and $ORIGIN is the folder of libkoru.
+    /// Not loaded. The loader gets the name as UTF-8, otherwise unchanged: it searches for a name
+    /// without a slash, and a relative path counts from the working directory. It searches on
+    /// behalf of libkoru: it does not use the program's DT_RUNPATH (but DT_RPATH and
+    /// LD_LIBRARY_PATH), and $ORIGIN is the folder of libkoru.
     DynamicLibrary(std::wstring const& fileName);
 
-    /// Copies the name and, if the other is loaded, loads the library again under a handle of its
-    /// own.
+    /// Copies the name and, if the other object is loaded, loads the library again under a handle
+    /// of its own. Does not call an override of `load`.
     DynamicLibrary(DynamicLibrary const& other);
 
-    /// Unloads what is loaded, then copies as the copy constructor does. Nothing happens when an
-    /// object is assigned to itself.
+    /// Calls `unload` if this object is loaded, copies the name and, if the other object is loaded,
+    /// calls `load`. Does nothing when an object is assigned to itself.
     DynamicLibrary& operator=(DynamicLibrary const& other);
 
     /// Unloads the library.
     virtual ~DynamicLibrary();
 
-    /// Loads the library, binding its functions when they are first called and keeping its symbols
-    /// from other libraries; nothing happens when it is loaded.
+    /// Loads the library, unless it is loaded. Its functions are bound when they are first called,
+    /// and other libraries do not see its symbols.
     /// @return whether it is loaded now
     virtual bool load();
 
-    /// Gives the handle back, if there is one; symbols looked up before are not to be used any
-    /// more.
+    /// Gives the handle back, if there is one. Symbols looked up before are no longer valid.
     /// @return true
     virtual bool unload();
 
+    /// Whether the object has a handle.
     virtual bool isLoaded() const;
 
-    /// The loader's handle, null when not loaded. It stays the object's own.
+    /// The loader's handle, null when not loaded. The object keeps owning it.
     void* getHandle() const;
 
+    /// The name as it was given.
     std::wstring getFileName() const;
 
-    /// The address of a symbol, valid until the library is unloaded; null when it is missing or
-    /// nothing is loaded.
+    /// The address of a symbol, valid until the library is unloaded; null when the symbol is
+    /// missing or nothing is loaded.
     void* getSymbol(std::wstring const& name) const;
 
 private:

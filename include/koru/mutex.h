@@ -9,43 +9,44 @@
 
 namespace Koru {
 
-/// A recursive mutex that gives up after a time. The thread that holds it may lock it again and
-/// owes as many unlocks. Any thread may call lock, unlock and isLocked at once; copying and
-/// assigning are for objects that no other thread uses meanwhile.
+/// A recursive mutex whose `lock` gives up after a time. The thread that holds it may lock it again
+/// and has to unlock it as often. Several threads may call `lock`, `unlock` and `isLocked` at once;
+/// copy and assign a mutex only while no other thread uses it.
 ///
-/// It never blocks: it tries once per millisecond, so a contended lock is granted up to about a
-/// millisecond late, and there is no order among those who wait.
+/// It never blocks: `lock` tries once per millisecond. So a waiting thread may get the mutex up to
+/// about a millisecond after it is free, and waiting threads get it in no particular order.
 class KORU_EXPORT Mutex {
 public:
+    /// A free mutex.
     Mutex();
 
-    /// Intended: copies the state of the POSIX mutex byte for byte, so that a copy of a held mutex
-    /// is held too, by the same thread and as often.
+    /// Intended: copies the state of the POSIX mutex byte for byte, so a copy of a held mutex is
+    /// held too, by the same thread and as often.
     Mutex(Mutex const& other);
 
     /// Destroys this mutex, then copies as the copy constructor does.
     Mutex& operator=(Mutex const& other);
 
-    /// The mutex must not be held.
+    /// Destroys the mutex, which no thread may hold.
     ~Mutex();
 
     /// Tries once per millisecond to take the mutex; the thread that holds it succeeds at once.
-    /// A cancellation point while it waits.
+    /// While it waits, it is a cancellation point.
     /// @param timeout  number of tries, so roughly milliseconds; 0 gives up without a try, even on
-    ///                 a free mutex; 0xFFFFFFFF, the default, is as good as without limit (49.7
-    ///                 days)
-    /// @throws std::runtime_error "failed to obtain mutex within timeout"; it is not held then
+    ///                 a free mutex; 0xFFFFFFFF, the default, is practically no limit (49.7 days)
+    /// @throws std::runtime_error "failed to obtain mutex within timeout"; this call has not taken
+    ///         the mutex then
     void lock(unsigned long timeout = 0xFFFFFFFFUL);
 
-    /// Gives the mutex back once. Called without holding it, nothing happens. A forked child does
-    /// not hold what its parent's thread held, and cannot take it either.
+    /// Gives the mutex back once; does nothing when the calling thread does not hold it. After a
+    /// `fork` the child does not hold what the thread held that forked it, and cannot take it.
     void unlock();
 
-    /// True while another thread holds the mutex. The holder itself sees false: it may lock again.
+    /// Whether another thread holds the mutex; false for the holder itself, which may lock again.
     bool isLocked() const;
 
 private:
-    // Mutable, since asking whether it is held means trying it.
+    // Mutable, since isLocked has to try to lock it.
     mutable pthread_mutex_t mutex_;
 };
 

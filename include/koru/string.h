@@ -1,11 +1,11 @@
 /// @file
 /// Length, case-insensitive comparison, UTF-8 conversion and stream output of strings: the one
-/// place where the wide strings of the interface and the bytes of files and system calls meet.
+/// place where the wide strings of the interface meet the bytes of files and system calls.
 ///
 /// Everywhere in the library a string ends at its first NUL character, whatever its stored size.
-/// All functions may be called from any thread at once. None reports an error: text that cannot be
-/// converted comes out as described. Only `std::bad_alloc` can escape, also for text that is too
-/// long for a string; the inserters fail and throw as the stream's own output does.
+/// Several threads may call all functions at once. None reports an error: text that cannot be
+/// converted comes out as described. They throw nothing but `std::bad_alloc`, also for text that is
+/// too long for a string; the inserters fail and throw as the stream's own output does.
 #ifndef KORU_STRING_H
 #define KORU_STRING_H
 
@@ -17,8 +17,8 @@
 
 namespace Koru {
 
-/// The empty strings that `make_string` and `make_wstring` return copies of. They exist before any
-/// function of the library can be called, also from the static constructors of an application.
+/// The empty strings of which `make_string` and `make_wstring` return copies. They exist before any
+/// function of the library can be called, even by the static constructors of an application.
 extern KORU_EXPORT const std::string _null_string;
 extern KORU_EXPORT const std::wstring _null_wstring;
 
@@ -28,22 +28,22 @@ KORU_EXPORT std::size_t length(std::string const& s);
 KORU_EXPORT std::size_t length(wchar_t const* s);
 KORU_EXPORT std::size_t length(std::wstring const& s);
 
-/// Compares without regard to case, as `strcasecmp` and `wcscasecmp` (POSIX) do under the current C
-/// locale: negative, 0 or positive. Wide letters of ASCII, but for I and i, pair as in every locale
-/// of the C library, whatever a locale of one's own says. Characters of 0x80000000 and above
-/// compare as the C library subtracts them, which is not a consistent order. Pointers must not be
-/// null.
+/// Compares without regard to case, as `strcasecmp` and `wcscasecmp` (POSIX) do under the current
+/// C locale: negative, 0 or positive. Wide ASCII letters other than I and i pair as they do in
+/// every locale of the C library, even where a locale that you have compiled yourself pairs them
+/// differently. Characters of 0x80000000 and above compare as the C library subtracts them, which
+/// is not a consistent order. Pointers must not be null.
 KORU_EXPORT int compare(char const* a, char const* b);
 KORU_EXPORT int compare(std::string const& a, std::string const& b);
 KORU_EXPORT int compare(wchar_t const* a, wchar_t const* b);
 KORU_EXPORT int compare(std::wstring const& a, std::wstring const& b);
 
-/// Copies up to the first NUL; empty for a null pointer.
+/// Copies the text up to the first NUL; gives the empty string for a null pointer.
 KORU_EXPORT std::string make_string(char const* s);
 KORU_EXPORT std::wstring make_wstring(wchar_t const* s);
 
 /// Encodes as UTF-8 in its early form with sequences of up to six bytes (RFC 2279), so that every
-/// value from 0 to 0x7FFFFFFF, surrogates included, survives the way to UTF-8 and back. A value of
+/// value from 0 to 0x7FFFFFFF, surrogates included, survives encoding and decoding. A value of
 /// 0x80000000 or above becomes its low byte; if that byte is zero, the result ends there.
 /// A null pointer gives the empty string.
 KORU_EXPORT std::string make_string(std::wstring const& s);
@@ -53,22 +53,23 @@ KORU_EXPORT std::string make_string(wchar_t const* s);
 /// decides how many bytes make a character, each byte that follows gives its low six bits, overlong
 /// forms are accepted, and a character that the end of the text cuts short gives `?` for each of
 /// its bytes.
-/// Intended: a stray continuation byte (0x80 to 0xBF), 0xFE or 0xFF counts as the lead of six bytes
-/// wherever five more follow. An overlong zero ends the result. A null pointer gives the empty
-/// string.
+/// Intended: a stray continuation byte (0x80 to 0xBF), 0xFE or 0xFF counts as the first of six
+/// bytes wherever five more follow. An overlong zero ends the result. A null pointer gives the
+/// empty string.
 KORU_EXPORT std::wstring make_wstring(std::string const& s);
 KORU_EXPORT std::wstring make_wstring(char const* s);
 
-/// Writes every stored character of the string, NULs included, as its low 8 bits; nothing is
-/// encoded, so text beyond Latin-1 comes out garbled. For UTF-8 write `make_string(s)` with
+/// Writes every stored character of the string, NULs included, as its low 8 bits. It does not
+/// encode, so text beyond Latin-1 comes out garbled: for UTF-8, write `make_string(s)` with
 /// `os.write`. Width and fill apply to the first character only.
 KORU_EXPORT std::ostream& operator<<(std::ostream& os, std::wstring const& s);
 
 /// Writes the first n bytes of the string, n being the low 8 bits of its stored size read as a
 /// signed number; nothing when n is 0 or negative.
-/// Intended: 127 bytes are written whole, 128 to 256 bytes not at all, 300 bytes as their first 44.
-/// For text of any length use `os.write`. Inside namespace `Koru`, and wherever it is imported,
-/// this operator is chosen over the standard one. Width and fill apply to the first byte only.
+/// Intended: of 127 bytes it writes all, of 128 to 256 bytes none, of 300 bytes the first 44. For
+/// text of any length, use `os.write`. Inside namespace `Koru`, and wherever that is imported,
+/// the compiler chooses this operator over the standard one. Width and fill apply to the first
+/// byte only.
 KORU_EXPORT std::ostream& operator<<(std::ostream& os, std::string const& s);
 
 } // namespace Koru

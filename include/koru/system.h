@@ -9,19 +9,19 @@
 
 namespace Koru {
 
-/// Static functions only. Nothing throws, apart from `std::bad_alloc`.
+/// Static functions only. They throw nothing but `std::bad_alloc`.
 class KORU_EXPORT System {
 public:
     /// The absolute path of the running executable, symbolic links resolved, as argv[0] in
     /// "/proc/self/cmdline" gives it; `File::Path` resolves relative paths against its directory.
-    /// An empty string when that cannot be read. May be called from several threads at once.
+    /// An empty string when that cannot be read. Several threads may call it at once.
     ///
     /// Intended: argv[0] counts up to its first blank and its first 4095 bytes, and a relative one
-    /// is resolved against the working directory of the moment, not that of the program's start. A
-    /// program that calls `chdir`, one that was found through PATH, or one under a folder whose
-    /// name holds a blank gets a path that is not its own. Where nothing is at the resolved path,
-    /// the result is what `realpath` (POSIX) leaves behind: with glibc the path up to and including
-    /// the first missing component.
+    /// is resolved against the current working directory, not that of the program's start. So the
+    /// path is not the program's own if it was started by a relative path and has called `chdir`
+    /// since, if it was found through PATH, or if it lies under a folder with a blank in its name.
+    /// Where nothing exists at the resolved path, the result is what `realpath` (POSIX) leaves in
+    /// its buffer: with glibc, the path up to and including the first missing component.
     static std::wstring getProcessFileName();
 
     /// The platform's type: always 0 here.
@@ -31,9 +31,9 @@ public:
     static std::wstring getVersion();
 
     /// @name The host
-    /// Each is empty where the system does not tell. Names are looked up with `gethostbyname`
-    /// (POSIX.1-2001), which shares static storage: the last two are not called from several
-    /// threads at once without a lock.
+    /// Each is empty where the system does not tell. The last two look the name up with
+    /// `gethostbyname` (POSIX.1-2001), which uses static storage: threads that call them at once
+    /// need a lock of their own.
     /// @{
 
     /// The host's name (`gethostname`), up to 128 bytes.

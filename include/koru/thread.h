@@ -9,56 +9,57 @@
 
 namespace Koru {
 
-/// One POSIX thread, which calls `run` of the object. An object runs at most one thread in its
-/// life. `start`, `join`, `detach` and `abort` are called by one controlling thread; there is no
-/// lock.
+/// A POSIX thread that calls the object's `run`. An object runs at most one thread in its life. One
+/// controlling thread calls `start`, `join`, `detach` and `abort`; the object has no lock.
 ///
-/// The object outlives its thread: destroying it neither joins nor ends the thread. A derived class
-/// whose destructor joins, or a caller who joins before it, is on the safe side.
+/// The object has to outlive its thread, as its destructor neither joins nor ends the thread. So a
+/// derived class joins in its own destructor, or the caller joins before.
 class KORU_EXPORT Thread {
 public:
+    /// An object that has not started its thread.
     Thread();
 
+    /// Not copyable: the thread uses this very object.
     Thread(Thread const&) = delete;
     Thread& operator=(Thread const&) = delete;
 
-    /// Does nothing to the thread, which must have ended.
+    /// Does nothing to the thread, which has to have ended.
     virtual ~Thread();
 
-    /// Starts the thread, which calls `run(argument)`. When a thread was started before, even one
-    /// that has ended, nothing happens.
-    /// @return whether a thread was started now or before; after false it may be tried again
+    /// Starts the thread, which calls `run(argument)`; does nothing when the object has started a
+    /// thread before, even one that has ended.
+    /// @return whether a thread was started, now or before; after false you may try again
     bool start(void* argument);
 
-    /// Asks `run` to return: does nothing here; overridden where there is a way to ask.
+    /// Asks `run` to return. Does nothing here: a derived class that can ask overrides it.
     virtual void stop();
 
-    /// The thread's body, overridden by derived classes; this one returns null at once.
-    /// Cancellation unwinds it as an exception that must be let pass. Any other exception out of it
-    /// ends the thread with the exit value of all bits set, and is lost.
+    /// The thread's body, which derived classes override; this one returns null at once.
+    /// Cancellation unwinds it with an exception that it must let pass. Any other exception that
+    /// leaves it ends the thread with an exit value of all bits set, and is lost.
     /// @return the thread's exit value, which `join` returns
     virtual void* run(void* argument);
 
-    /// Cancels the thread at its next cancellation point and detaches it, so nobody learns when it
-    /// has ended; nothing happens unless it is started and not detached. Its stack is unwound.
+    /// Cancels the thread, whose stack is unwound from its next cancellation point, and detaches
+    /// it, so nobody learns when it has ended. Does nothing unless it is started and not detached.
     void abort();
 
-    /// Detaches the thread; before `start`, the thread will start detached.
+    /// Detaches the thread; called before `start`, makes it start detached.
     void detach();
 
     /// Waits for the thread to end.
-    /// @return its exit value; null, at once, when it was not started, or was joined, detached or
+    /// @return its exit value; null, at once, if it was not started, or was joined, detached or
     ///         aborted before
     void* join();
 
-    /// The thread's identifier (a `pthread_t`); without meaning before a successful `start`.
+    /// The thread's identifier (a `pthread_t`); means nothing before a successful `start`.
     unsigned long getThreadId() const;
 
     /// The identifier of the calling thread.
     static unsigned long getCurrentThreadId();
 
-    /// Suspends the calling thread. A signal ends it early.
-    /// @param milliseconds  beyond 4294967 the part below a second is not exact
+    /// Suspends the calling thread; a signal ends the pause early.
+    /// @param milliseconds  above 4294967, the part below a second is not exact
     static void sleep(unsigned int milliseconds);
 
 private:
@@ -68,10 +69,10 @@ private:
     pthread_t threadId_;
     void* argument_;
     bool started_;
-    bool detached_; // or joined, or aborted, or to be started so
+    bool detached_; // or joined or aborted, or to be detached by start
 };
 
-/// What a thread begins with: calls `run` of the `Thread` given, with its argument.
+/// The function that a new thread executes: calls `run` of the given `Thread` with its argument.
 KORU_EXPORT void* ThreadFunction(void* thread);
 
 } // namespace Koru

@@ -1,5 +1,5 @@
 /// @file
-/// A stopwatch that streams write.
+/// A stopwatch that shows its time on a stream.
 #ifndef KORU_TIMER_H
 #define KORU_TIMER_H
 
@@ -10,23 +10,24 @@
 
 namespace Koru {
 
-/// The moment of its making, by the wall clock; written to a stream it gives the seconds since
-/// then. A plain value: distinct objects may be used from several threads at once.
+/// Remembers when it was made, by the system's clock; written to a stream, it shows the seconds
+/// since then. A plain value: several threads may use distinct objects at once.
 ///
-/// Intended: the time elapsed is the difference of two 32-bit floats of seconds since the epoch,
-/// which today have steps of 128 seconds. So it reads 0.000 until it jumps to 128.000. For time
-/// measured finely use `std::chrono::steady_clock`.
+/// Intended: the time elapsed is the difference of two 32-bit floats that count seconds since the
+/// epoch, and such floats are 128 seconds apart today. So a timer shows 0.000 until it jumps to
+/// 128.000. To measure time precisely, use `std::chrono::steady_clock`.
 class KORU_EXPORT Timer {
 public:
     /// Starts now.
     Timer();
 
-    /// Starts anew, now.
+    /// Starts again, now.
     void reset();
 
-    /// The start moment, not the time elapsed: seconds since the epoch and milliseconds (0 to 999)
-    /// within the second.
+    /// When the timer was started, not the time elapsed: whole seconds since the epoch.
     std::uint32_t getSeconds() const;
+
+    /// The milliseconds of that moment, 0 to 999.
     std::uint32_t getMilliseconds() const;
 
 private:
@@ -35,7 +36,7 @@ private:
 };
 
 /// Writes the seconds since the start with three decimals.
-/// Intended: the stream keeps fixed notation, `showpoint` and a precision of 3.
+/// Intended: the stream's fixed notation, `showpoint` and precision of 3 remain set.
 KORU_EXPORT std::ostream& operator<<(std::ostream& os, Timer const& timer);
 
 } // namespace Koru

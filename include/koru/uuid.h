@@ -12,27 +12,30 @@
 namespace Koru {
 
 /// 16 bytes with the text form of RFC 9562: 32 lower-case hexadecimal digits in groups of 8, 4, 4,
-/// 4 and 12 with hyphens between them. A plain value: distinct objects may be used from several
-/// threads at once. Identifiers are not generated here.
+/// 4 and 12 with hyphens between them. A plain value: several threads may use distinct objects at
+/// once. The library does not generate identifiers.
 ///
-/// Nothing is thrown for bad input: it gives the identifier of 16 zero bytes.
+/// Bad input throws nothing: it gives the identifier of 16 zero bytes.
 class KORU_EXPORT Uuid {
 public:
     /// 16 zero bytes.
     Uuid();
 
+    /// The 16 bytes in the order given.
     Uuid(unsigned char const (&bytes)[16]);
 
-    /// All zero unless there are exactly 16 bytes.
+    /// The same; all zero when the vector has any other size than 16.
     Uuid(std::vector<unsigned char> const& bytes);
 
-    /// Reads the text form in lower or upper case; all zero for text that is refused.
-    /// Intended: what is asked is 36 characters (up to the first NUL), hexadecimal digits and
-    /// hyphens, and no hyphen among the last as many characters as there are hyphens. So the
-    /// hyphens may stand elsewhere, and of 36 digits without any the last four are ignored; with
-    /// more than four hyphens fewer than 32 digits are enough, and the last are read twice.
+    /// Reads the text form, in lower or upper case; all zero for text that it refuses.
+    /// Intended: it accepts every text of 36 hexadecimal digits and hyphens (counted up to the
+    /// first NUL) that has no hyphen among its last n characters, n being the number of its
+    /// hyphens. So hyphens may be in other places, and of 36 digits without a hyphen it ignores the
+    /// last four. With more than four hyphens fewer than 32 digits are enough; it reads the last
+    /// ones twice.
     Uuid(std::string const& text);
 
+    /// The 16 bytes in order.
     operator std::vector<unsigned char>() const;
 
     /// The text form, 36 characters.
@@ -45,6 +48,7 @@ private:
     unsigned char bytes_[16];
 };
 
+/// Equal when all 16 bytes are.
 KORU_EXPORT bool operator==(Uuid const& a, Uuid const& b);
 KORU_EXPORT bool operator!=(Uuid const& a, Uuid const& b);
 
