@@ -1,8 +1,8 @@
-// Tells about the host and this program.
+// Prints what the library tells about the host and this program.
 //
 //     hostinfo
 //
-// What the system does not tell is shown as a hyphen: a host whose name does not resolve has no
+// A hyphen replaces what the system does not tell: a host whose name does not resolve has no
 // official name and no address.
 #include <koru/string.h>
 #include <koru/system.h>
@@ -13,8 +13,8 @@
 namespace {
 
 void line(char const* label, std::wstring const& value) {
-    // The library's own inserters for strings are not for text of any length, so UTF-8 goes
-    // through the standard one, which is found here outside of namespace Koru.
+    // The library's own inserters do not write text of any length, so UTF-8 goes through the
+    // standard one, which the compiler finds here, outside of namespace Koru.
     std::cout << label << (value.empty() ? "-" : Koru::make_string(value)) << '\n';
 }
 

@@ -2,7 +2,7 @@
 //
 //     log FILE TEXT...
 //
-// Any number of these may write to one file at once; no line is lost or torn.
+// Any number of processes may write to one file at once; no line is lost or torn.
 #include <koru/logfile.h>
 #include <koru/string.h>
 
@@ -34,10 +34,10 @@ std::string timeStamp() {
 }
 
 void append(LogFile& log, std::string const& line) {
-    // A missing file is created here, since the log would empty what another has created meanwhile.
+    // Creates a missing file: the log itself might empty one that another process has just created.
     std::ofstream const created(Koru::make_string(log.getName()), std::ios::app);
     log.open(File::READ | File::WRITE); // WRITE alone would empty the file
-    // Unformatted and at once, so that a line of any length goes to the system in one piece.
+    // One unformatted write, so that a line of any length goes to the system in one piece.
     log.write(line.data(), static_cast<std::streamsize>(line.size())).flush();
     if (!log) throw std::runtime_error("failed to write to file");
     log.close();

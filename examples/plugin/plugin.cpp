@@ -2,9 +2,9 @@
 //
 //     plugin LIBRARY FUNCTION
 //
-// The function is one without arguments that returns text. A library's name without a slash is
-// searched for as the system's loader does; with one it is a path, which counts from the working
-// directory when it is relative.
+// The function takes no arguments and returns text. The system's loader searches for a library
+// whose name has no slash; a name with one is a path, and a relative path counts from the working
+// directory.
 #include <koru/dynamiclibrary.h>
 #include <koru/string.h>
 
@@ -20,7 +20,7 @@ int main(int argc, char** argv) {
     }
     Koru::DynamicLibrary library(Koru::make_wstring(argv[1]));
     if (!library.load()) {
-        char const* const reason = ::dlerror(); // There for the first who asks after a load.
+        char const* const reason = ::dlerror(); // Told once, right after a failed load.
         std::cerr << "plugin: " << (reason == nullptr ? "cannot load" : reason) << '\n';
         return 1;
     }
@@ -30,7 +30,7 @@ int main(int argc, char** argv) {
         return 1;
     }
     auto* const function = reinterpret_cast<char const* (*)()>(symbol);
-    // The text lies in the library, which stays loaded up to the end of this function.
+    // The text is in the library, which stays loaded until this function ends.
     std::cout << function() << '\n';
     return 0;
 }

@@ -2,13 +2,13 @@
 //
 //     records FILE list               the keys and the sizes of their data
 //     records FILE get KEY            the data in hexadecimal and as text, like hexdump -C
-//     records FILE put KEY TEXT       puts text in, in place of what the key had
-//     records FILE put KEY @DATAFILE  puts the content of another file in
+//     records FILE put KEY TEXT       replaces the key's data by text
+//     records FILE put KEY @DATAFILE  replaces it by the content of another file
 //     records FILE remove KEY
 //
-// Text on the command line and on the terminal is UTF-8. Keys are the same without regard to case;
-// their characters go up to U+00FF, for the file keeps no more of them. The order of records has no
-// meaning.
+// Text on the command line and on the terminal is UTF-8. Keys match without regard to case; they
+// have no characters above U+00FF, as the file keeps only 8 bits of each. The order of records has
+// no meaning.
 #include <koru/datafile.h>
 #include <koru/string.h>
 
@@ -75,7 +75,7 @@ void printLine(std::size_t offset, unsigned char const* bytes, std::size_t count
     std::printf(" |%s|\n", text.c_str());
 }
 
-/// Sixteen bytes a line. A star stands for lines that are the same as the one before.
+/// Prints sixteen bytes a line, and a star for lines that are the same as the one before.
 void dump(Bytes const& data) {
     bool starred = false;
     for (std::size_t at = 0; at < data.size(); at += 16) {
@@ -111,7 +111,8 @@ int get(DataFile& file, char** words) {
     throw std::runtime_error(std::string("no record ") + words[0]);
 }
 
-/// A file that cannot be read whole stays as it is. The destructor would write what could be read.
+/// Opens a file to change it. One that cannot be read whole stays as it is, while the destructor
+/// would replace it by what could be read.
 void openForChange(DataFile& file) {
     try {
         file.open(File::READ | File::WRITE);
@@ -126,7 +127,7 @@ int put(DataFile& file, char** words) {
     openForChange(file);
     file.remove(record); // insert() would leave a record with this key as it is
     file.insert(record);
-    file.close(); // Writes the file. The destructor would too, but could not tell of a failure.
+    file.close(); // Writes the file. The destructor would too, but could not report a failure.
     return 0;
 }
 

@@ -51,7 +51,7 @@ int get(InitializationFile& settings, char** names) {
 int set(InitializationFile& settings, char** words) {
     settings.open(File::READ | File::WRITE);
     settings.setValue(make_wstring(words[0]), make_wstring(words[1]), make_wstring(words[2]));
-    settings.close(); // Writes the file. The destructor would too, but could not tell of a failure.
+    settings.close(); // Writes the file. The destructor would too, but could not report a failure.
     return 0;
 }
 

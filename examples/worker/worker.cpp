@@ -1,8 +1,8 @@
-// A thread that is fed with work by an event, asked to stop and joined.
+// Feeds a thread with numbers, asks it to stop and joins it.
 //
 //     worker NUMBER...
 //
-// Prints the sum of the numbers, which the worker has added up one by one.
+// Prints the sum of the numbers, which the thread has added up one by one.
 #include <koru/event.h>
 #include <koru/mutex.h>
 #include <koru/thread.h>
@@ -25,13 +25,13 @@ private:
     Koru::Mutex& mutex_;
 };
 
-/// Adds up the numbers it is given until it is stopped and there are none left.
+/// Adds up the numbers that it gets, until it is stopped and none are left.
 class Adder : public Koru::Thread {
 public:
     Adder() : fed_(true), stopping_(false) {}
     Adder(Adder const&) = delete;
     Adder& operator=(Adder const&) = delete;
-    /// The object outlives its thread.
+    /// Waits for the thread, which uses this object.
     ~Adder() override {
         stop();
         static_cast<void>(join()); // Returns at once if the thread was joined before.
@@ -50,12 +50,12 @@ public:
 
     void* run(void*) override {
         for (;;) {
-            // Looked at first: what was fed before the stop is worked off below.
+            // Tested first, so that the numbers fed before the stop are still added below.
             bool const last = stopping_.test();
             workOff();
             if (last) return &sum_;
-            // The flag tells of numbers that came since; a signal between test and wait would be
-            // missed, so the wait ends after a second.
+            // The flag tells of numbers fed since then. The wait would miss a signal that comes
+            // between test and wait, so it ends after a second.
             if (!fed_.test()) static_cast<void>(fed_.wait(1));
         }
     }
@@ -65,7 +65,7 @@ private:
     std::deque<long> numbers_;
     Koru::Event fed_;
     Koru::Event stopping_; // stays signalled
-    long sum_ = 0;         // the thread's own until it is joined
+    long sum_ = 0;         // only the thread uses it until it is joined
 
     void workOff() {
         Guard const guard(mutex_);
@@ -78,7 +78,7 @@ private:
 int main(int argc, char** argv) {
     Adder adder;
     if (!adder.start(nullptr)) {
-        std::cerr << "worker: no thread to be had\n";
+        std::cerr << "worker: cannot start a thread\n";
         return 1;
     }
     for (int i = 1; i < argc; ++i) adder.feed(std::strtol(argv[i], nullptr, 10));

@@ -1,5 +1,5 @@
-// What the fragments of C++ in the documents take for granted: script/check-documents compiles them
-// behind this.
+// What the C++ fragments in the documents take for granted: script/check-documents compiles them
+// after this.
 #ifndef KORU_TESTS_FRAGMENTS_H
 #define KORU_TESTS_FRAGMENTS_H
 
