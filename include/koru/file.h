@@ -13,12 +13,10 @@
 
 namespace Koru {
 
-/// A slash, which separates the parts of a path; a backslash, which parsing a path turns into a
-/// slash; and a colon, which nothing uses (there are no drive letters here). Static constructors
-/// may use them.
-extern KORU_EXPORT wchar_t const _FSLASH;
-extern KORU_EXPORT wchar_t const _BSLASH;
-extern KORU_EXPORT wchar_t const _COLON;
+/// Characters of paths. Static constructors may use them.
+extern KORU_EXPORT wchar_t const _FSLASH; ///< a slash, which separates the parts of a path
+extern KORU_EXPORT wchar_t const _BSLASH; ///< a backslash, which a parsed path replaces by a slash
+extern KORU_EXPORT wchar_t const _COLON;  ///< a colon, which nothing uses: there are no drives here
 
 /// A narrow file stream with a wide name, an open mode that it remembers, a recursive lock and
 /// static operations on whole files:
@@ -179,17 +177,20 @@ public:
     virtual ~Path();
 
     /// @name Parts
-    /// A reference is valid as long as the path. A setter takes its part verbatim: it checks
-    /// nothing and adds no separator.
+    /// A getter's reference is valid as long as the path. A setter takes its part verbatim: it
+    /// checks nothing and adds no separator.
     /// @{
-    virtual std::wstring const& getVolume() const; ///< empty, unless it was set
+
+    /// The volume; empty, unless it was set.
+    virtual std::wstring const& getVolume() const;
     virtual void setVolume(std::wstring const& volume);
-    /// Begins and ends with a slash, if it was parsed.
+    /// The directory; begins and ends with a slash, if it was parsed.
     virtual std::wstring const& getDirectory() const;
     virtual void setDirectory(std::wstring const& directory);
-    /// Has no slash, if it was parsed, and may be empty.
+    /// The name; has no slash, if it was parsed, and may be empty.
     virtual std::wstring const& getName() const;
     virtual void setName(std::wstring const& name);
+
     /// @}
 
     /// Volume, directory and name, with nothing between them.
