@@ -8,6 +8,7 @@
 
 #include "concurrency/cancellation.h"
 #include "file/fileguard.h"
+#include "file/filereader.h"
 
 namespace Koru {
 
@@ -28,7 +29,7 @@ public:
     virtual void writeTo(Sink& sink) const = 0;
 };
 
-/// Opens the file, discards what was held in memory and loads the file if the mode says so. A
+/// Opens the file, discards what was held in memory and calls `load(reader)` if the mode says so. A
 /// cancellation leaves the mode 0: the destructor, which the same unwinding may call next, would
 /// write what was loaded so far over the file.
 template <class Discard, class Load>
@@ -38,7 +39,9 @@ void openAndLoad(File& file, unsigned long mode, Discard discard, Load load) {
         [&] {
             file.File::open(mode);
             discard();
-            if ((file.getMode() & File::READ) != 0) load();
+            if ((file.getMode() & File::READ) == 0) return;
+            FileReader reader(file);
+            load(reader);
         },
         [&file] { file.File::setMode(0); });
 }

@@ -6,6 +6,8 @@
 #include <koru/string.h>
 
 #include "concurrency/cancellation.h"
+#include "file/fileguard.h"
+#include "file/filereader.h"
 #include "file/rewrite.h"
 #include "records/recordfile.h"
 #include "records/recordset.h"
@@ -59,7 +61,7 @@ DataFile::~DataFile() {
 void DataFile::open(unsigned long mode) {
     openAndLoad(
         *this, mode | BINARY, [this] { records_->clear(); },
-        [this] { readRecords(*this, *records_); });
+        [this](FileReader& reader) { readRecords(reader, *records_); });
 }
 
 void DataFile::close() {

@@ -12,7 +12,6 @@
 #include <string_view>
 #include <vector>
 
-#include "file/rewind.h"
 #include "text/simd.h"
 
 namespace Koru {
@@ -68,9 +67,9 @@ void _encodeKey(wchar_t const* key, std::size_t size, char* to) {
 }
 
 /// Reads one record after the other. Memory is reused from one to the next.
-class Reader {
+class RecordReader {
 public:
-    explicit Reader(File& file) : file_(file), block_(new char[BLOCK]) {}
+    explicit RecordReader(FileReader& file) : file_(file), block_(new char[BLOCK]) {}
 
     bool atEnd() { return at_ == filled_ && !fill(); }
 
@@ -81,20 +80,13 @@ public:
     }
 
 private:
-    [[noreturn]] void fail() {
-        file_.setstate(std::ios::failbit);
-        throw std::runtime_error("failed to read from file");
-    }
-
-    /// Fetches a block of the file, what one peek brings; false at the end.
+    /// Fetches what arrives next; false at the end of the file.
     bool fill() {
-        bool const nothingMore = file_.peek() == std::char_traits<char>::eof();
-        // An error looks like the end, too.
-        if (file_.bad()) fail();
-        if (nothingMore) return false;
-        auto const arrived = std::min<std::streamsize>(file_.rdbuf()->in_avail(), BLOCK);
+        std::size_t const arrived = file_.arrived();
+        if (file_.hasFailed()) file_.fail();
+        if (arrived == 0) return false;
         at_ = 0;
-        filled_ = static_cast<std::size_t>(file_.rdbuf()->sgetn(block_.get(), arrived));
+        filled_ = file_.take(block_.get(), std::min(arrived, BLOCK));
         return true;
     }
 
@@ -107,7 +99,7 @@ private:
 
     void read(char* to, std::size_t size) {
         while (size != 0) {
-            if (atEnd()) fail();
+            if (atEnd()) file_.fail();
             std::size_t const step = std::min(size, filled_ - at_);
             std::memcpy(to, take(step), step);
             to += step;
@@ -167,7 +159,7 @@ private:
         _decodeKey(bytes, pairs, &key_[0]);
     }
 
-    File& file_;
+    FileReader& file_;
     std::unique_ptr<char[]> block_;
     std::size_t at_ = 0;
     std::size_t filled_ = 0;
@@ -236,10 +228,9 @@ private:
 
 } // namespace
 
-void readRecords(File& file, RecordSet& records) {
-    rewind(file);
-    Reader reader(file);
-    while (!reader.atEnd()) reader.readInto(records);
+void readRecords(FileReader& reader, RecordSet& records) {
+    RecordReader record(reader);
+    while (!record.atEnd()) record.readInto(records);
 }
 
 RecordContent::RecordContent(RecordSet const& records)

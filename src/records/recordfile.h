@@ -13,15 +13,16 @@
 
 #include <memory>
 
+#include "file/filereader.h"
 #include "file/rewrite.h"
 #include "records/recordset.h"
 
 namespace Koru {
 
-/// Adds every record of the file to the set.
+/// Adds every record of a file to the set.
 /// @throws std::runtime_error "failed to read from file"
 /// @throws std::invalid_argument "zero length key"
-void readRecords(File& file, RecordSet& records);
+void readRecords(FileReader& reader, RecordSet& records);
 
 /// The records as bytes, in blocks of one size however large they are.
 class RecordContent : public Content {

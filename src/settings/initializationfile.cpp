@@ -5,8 +5,10 @@
 #include <koru/string.h>
 
 #include "concurrency/cancellation.h"
+#include "file/fileguard.h"
+#include "file/filereader.h"
 #include "file/rewrite.h"
-#include "settings/load.h"
+#include "settings/lines.h"
 #include "settings/render.h"
 #include "settings/settingstable.h"
 
@@ -61,10 +63,10 @@ private:
     std::uint32_t number_ = 0;
 };
 
-void _read(File& file, SettingsTable& table) {
+void _read(FileReader& reader, SettingsTable& table) {
     Parser parser(table);
-    loadLines(file, table,
-              [&parser](std::string_view line, bool plain) { parser.parse(line, plain); });
+    parseLines(table.hold(reader.readAll()),
+               [&parser](std::string_view line, bool plain) { parser.parse(line, plain); });
 }
 
 } // namespace
@@ -81,8 +83,8 @@ InitializationFile::~InitializationFile() {
 void InitializationFile::open(unsigned long mode) {
     openAndLoad(
         *this, mode, [this] { table_->clear(); },
-        [this] {
-            _read(*this, *table_);
+        [this](FileReader& reader) {
+            _read(reader, *table_);
             table_->sort();
         });
 }

@@ -5,28 +5,15 @@
 #include <cstddef>
 #include <cstring>
 #include <exception>
-#include <memory>
 #include <string_view>
 
-#include <koru/file.h>
+#include "file/filereader.h"
+#include "settings/storedtext.h"
 
 namespace Koru {
 
-/// The bytes of a file.
-struct FileBytes {
-    std::unique_ptr<char[]> data;
-    std::size_t size = 0;
-    std::exception_ptr failure; ///< what came after them in place of the file's end; mostly null
-};
-
-/// Flushes the stream, clears its state and reads the file from its start to its end, or up to what
-/// failed: an error, which throws where the caller enabled the stream's exceptions, or want of
-/// memory. Leaves the stream as a peek at the end does.
-/// @throws what `rewind` throws
-FileBytes readBytes(File& file);
-
-/// Calls `use` with every line that is not empty. Only a line feed ends a line; after an error the
-/// last line counts only if one ended it.
+/// Calls `use(line)` for every line that is not empty. Only a line feed ends a line. So does the
+/// end of the file, but not a failure: the line that it cut short is left out.
 template <class Use>
 void eachLine(FileBytes const& bytes, Use use) {
     char const* at = bytes.data.get();
@@ -55,6 +42,18 @@ inline std::string_view trim(std::string_view line) {
 /// Whether a trimmed line is a comment.
 inline bool isComment(std::string_view line) {
     return !line.empty() && (line.front() == '#' || line.front() == ';');
+}
+
+/// Calls `parse(line, plain)` for every line that is neither empty nor a comment, trimmed; `plain`
+/// is what `isPlain` says of it.
+/// @throws what reading the file ended with, after the lines that came before
+template <class Parse>
+void parseLines(FileBytes const& bytes, Parse parse) {
+    eachLine(bytes, [&parse](std::string_view untrimmed) {
+        std::string_view const line = trim(untrimmed);
+        if (!isComment(line)) parse(line, isPlain(line));
+    });
+    if (bytes.failure != nullptr) std::rethrow_exception(bytes.failure);
 }
 
 } // namespace Koru

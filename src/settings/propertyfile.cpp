@@ -5,8 +5,10 @@
 #include <koru/string.h>
 
 #include "concurrency/cancellation.h"
+#include "file/fileguard.h"
+#include "file/filereader.h"
 #include "file/rewrite.h"
-#include "settings/load.h"
+#include "settings/lines.h"
 #include "settings/render.h"
 #include "settings/settingstable.h"
 
@@ -32,10 +34,10 @@ void _parse(std::string_view line, bool plain, SettingsTable& list) {
     list.append(0, key, list.keep(line.substr(equals + 1), plain));
 }
 
-void _read(File& file, SettingsTable& list) {
+void _read(FileReader& reader, SettingsTable& list) {
     list.addSection(StoredText()); // number 0
-    loadLines(file, list,
-              [&list](std::string_view line, bool plain) { _parse(line, plain, list); });
+    parseLines(list.hold(reader.readAll()),
+               [&list](std::string_view line, bool plain) { _parse(line, plain, list); });
 }
 
 } // namespace
@@ -51,7 +53,8 @@ PropertyFile::~PropertyFile() {
 
 void PropertyFile::open(unsigned long mode) {
     openAndLoad(
-        *this, mode, [this] { list_->clear(); }, [this] { _read(*this, *list_); });
+        *this, mode, [this] { list_->clear(); },
+        [this](FileReader& reader) { _read(reader, *list_); });
 }
 
 void PropertyFile::close() {

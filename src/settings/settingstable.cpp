@@ -19,15 +19,14 @@ void SettingsTable::clear() {
 }
 
 FileBytes const& SettingsTable::hold(FileBytes bytes) {
+    constexpr std::size_t usualLine = 32; // bytes
     bytes_ = std::move(bytes);
-    return bytes_;
-}
-
-void SettingsTable::expect(std::size_t count) noexcept {
     try {
-        entries_.reserve(count);
-    } catch (std::exception const&) { // std::bad_alloc, or std::length_error where it is absurd
+        entries_.reserve(bytes_.size / usualLine);
+    } catch (
+        std::exception const&) { // Memory is short, or the guess absurd: they get it one by one.
     }
+    return bytes_;
 }
 
 StoredText SettingsTable::keep(std::string_view bytes) {

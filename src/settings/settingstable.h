@@ -15,7 +15,7 @@
 #include <string_view>
 #include <vector>
 
-#include "settings/lines.h"
+#include "file/filereader.h"
 #include "settings/storedtext.h"
 #include "text/fingerprint.h"
 
@@ -41,14 +41,12 @@ public:
     /// @name Loading
     /// @{
 
-    /// Takes the bytes that the texts of the entries to come are views of. The table is empty.
+    /// Takes the bytes that the texts of the entries to come are views of, and makes room for about
+    /// as many entries as there may be. The table is empty.
     FileBytes const& hold(FileBytes bytes);
 
     /// The held bytes. All text that is kept as bytes and is not empty lies in them.
-    std::string_view held() const { return std::string_view(bytes_.data.get(), bytes_.size); }
-
-    /// Makes room for about as many entries. It is a guess: there is none where memory is short.
-    void expect(std::size_t count) noexcept;
+    std::string_view held() const { return bytes_.view(); }
 
     /// A text of the held bytes as make_wstring converts it: it ends at its first NUL, and what is
     /// not well-formed is kept as the characters that it decodes to.
