@@ -21,45 +21,57 @@ namespace {
 
 using Entry = SettingsTable::Entry;
 
-/// The name in a trimmed line that begins with "[": without the run of "]" at its end, then without
-/// the run of "[" at its start, unless nothing else is left. Nothing more is asked of a header.
+/// The name in a header: the line without the "]" at its end, then without the "[" at its start
+/// unless there is nothing else.
 std::string_view _sectionName(std::string_view line) {
     std::string_view const opened = line.substr(0, line.find_last_not_of(']') + 1);
     std::size_t const name = opened.find_first_not_of('[');
     return name == std::string_view::npos ? opened : opened.substr(name);
 }
 
-/// Adds the entries of one line after the other to a table, each to the section of the last header.
+/// Adds to a table what the lines of a file say. A trimmed line is
+///
+///     line    = comment | header | entry | anything else, which is left out
+///     comment = ( "#" | ";" ) text
+///     header  = "[" { "[" } name { "]" }
+///     entry   = key "=" value
+///     key     = text without "="
+///     value   = text
+///     name    = text that neither begins with "[" nor ends with "]"
+///
+/// and the first of these that fits. A header of brackets alone has its "[" for a name. An entry
+/// belongs to the section of the last header; before the first header, and where its key is empty,
+/// it is left out. (parseLines has dealt with the comments.)
 class Parser {
 public:
     explicit Parser(SettingsTable& table) : table_(table) {}
 
     void parse(std::string_view line, bool plain) {
         if (line.front() == '[') {
-            section_ = table_.keep(_sectionName(line), plain);
-            sectionIsKnown_ = false;
+            section_ = table_.view(_sectionName(line), plain);
+            sectionIsAdded_ = false;
             return;
         }
         std::size_t const equals = line.find('=');
         if (equals == std::string_view::npos) return;
-        StoredText const key = table_.keep(line.substr(0, equals), plain);
+        StoredText const key = table_.view(line.substr(0, equals), plain);
         if (key.empty() || section_.empty()) return;
         // Neither is trimmed: blanks around "=" belong to key and value.
-        StoredText const value = table_.keep(line.substr(equals + 1), plain);
-        table_.append(sectionNumber(), key, value);
+        StoredText const value = table_.view(line.substr(equals + 1), plain);
+        table_.add(sectionNumber(), key, value);
     }
 
 private:
-    /// The table learns a section's name with its first entry, for it exists only with entries.
+    /// Adds the name of a section with its first entry, since without entries there is no section.
     std::uint32_t sectionNumber() {
-        if (!sectionIsKnown_) number_ = table_.addSection(section_);
-        sectionIsKnown_ = true;
+        if (!sectionIsAdded_) number_ = table_.addSection(section_);
+        sectionIsAdded_ = true;
         return number_;
     }
 
     SettingsTable& table_;
     StoredText section_;
-    bool sectionIsKnown_ = false;
+    bool sectionIsAdded_ = false;
     std::uint32_t number_ = 0;
 };
 

@@ -21,17 +21,26 @@ namespace {
 
 using Entry = SettingsTable::Entry;
 
-// All entries of the table stand in the section with the empty name.
+// All entries of the table are in the section with the empty name.
 std::wstring const& _section() { return _null_wstring; }
 
-/// A line without "=" has no key, only a value, and so gives no entry.
+/// Adds to a list what a line says. A trimmed line is
+///
+///     line    = comment | entry | anything else, which is left out
+///     comment = ( "#" | ";" ) text
+///     entry   = key "=" value
+///     key     = text without "="
+///     value   = text
+///
+/// and the first of these that fits. An entry whose key is empty is left out. (parseLines has dealt
+/// with the comments.)
 void _parse(std::string_view line, bool plain, SettingsTable& list) {
     std::size_t const equals = line.find('=');
     if (equals == std::string_view::npos) return;
-    StoredText const key = list.keep(line.substr(0, equals), plain);
+    StoredText const key = list.view(line.substr(0, equals), plain);
     if (key.empty()) return;
     // Neither is trimmed: blanks around "=" belong to key and value.
-    list.append(0, key, list.keep(line.substr(equals + 1), plain));
+    list.add(0, key, list.view(line.substr(equals + 1), plain));
 }
 
 void _read(FileReader& reader, SettingsTable& list) {

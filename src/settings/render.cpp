@@ -118,7 +118,7 @@ RenderedText render(SettingsTable const& table, Headers headers) {
     std::uint64_t const bound = _bound(table, headers);
     if (bound > std::numeric_limits<std::size_t>::max()) throw std::bad_alloc();
     std::unique_ptr<char[]> bytes(new char[static_cast<std::size_t>(bound)]);
-    Writer writer(bytes.get(), table.held());
+    Writer writer(bytes.get(), table.heldBytes());
     _write(table, headers, writer);
     auto const size = static_cast<std::size_t>(writer.finish() - bytes.get());
     return RenderedText(std::move(bytes), size);

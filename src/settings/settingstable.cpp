@@ -29,12 +29,12 @@ FileBytes const& SettingsTable::hold(FileBytes bytes) {
     return bytes_;
 }
 
-StoredText SettingsTable::keep(std::string_view bytes) {
+StoredText SettingsTable::view(std::string_view bytes) {
     if (isPlain(bytes)) return StoredText(bytes);
     std::string_view const text = bytes.substr(0, bytes.find('\0'));
     if (isCanonical(text)) return StoredText(text);
     std::wstring const decoded = make_wstring(text.data(), text.size());
-    return decoded.empty() ? StoredText() : own(decoded);
+    return decoded.empty() ? StoredText() : hold(decoded);
 }
 
 std::uint32_t SettingsTable::addSection(StoredText const& name) {
@@ -57,8 +57,7 @@ void SettingsTable::sort() {
         std::uint32_t const rankB = ranks[b.section];
         return rankA < rankB || (rankA == rankB && compare(a.key, b.key) < 0);
     };
-    // Stays in bounds even where names have no consistent order, as with characters beyond
-    // 0x7FFFFFFF.
+    // Characters beyond 0x7FFFFFFF have no consistent order; this stays in bounds even then.
     std::stable_sort(entries_.begin(), entries_.end(), byRank);
 }
 
@@ -83,18 +82,17 @@ std::size_t SettingsTable::find(std::wstring const& section, std::wstring const&
     auto const isAt = [this, &matches, &key](std::size_t i) {
         return matches(entries_[i]) && areEqual(entries_[i].key, key);
     };
-    constexpr std::size_t few = 4; // So many are compared sooner than the column is made.
+    constexpr std::size_t few = 4; // Comparing so many takes less than making the column.
     if (entries_.size() > few && entries_.size() != fingerprints_.size()) completeFingerprints();
     if (!fingerprints_.empty()) {
-        // Nothing mixed into nothing is 0: all entries of a flat file are in the section of no
-        // name.
+        // An empty name, as a flat file's section has it, mixes to 0.
         std::uint32_t const before = section.empty() ? 0 : mixFingerprint(0, section);
         Fingerprint const wanted = toFingerprint(mixFingerprint(before, key));
         std::size_t i = findFingerprint(fingerprints_, wanted, 0);
         while (i != NOT_FOUND && !isAt(i)) i = findFingerprint(fingerprints_, wanted, i + 1);
         if (i != NOT_FOUND) return i;
     }
-    // What the column does not cover is compared entry by entry.
+    // Entries beyond the column are compared one by one.
     for (std::size_t i = fingerprints_.size(); i != entries_.size(); ++i) {
         if (isAt(i)) return i;
     }
@@ -124,12 +122,12 @@ bool SettingsTable::sameSection(Entry const& a, Entry const& b) const {
 
 void SettingsTable::add(std::wstring const& section, std::wstring const& key,
                         std::wstring const& value) {
-    // What has to be allocated comes first, so that a failure leaves the entries as they are.
+    // First what takes memory, so that a failure leaves the entries as they are.
     if (entries_.size() == entries_.capacity())
         entries_.reserve(std::min(2 * entries_.size() + 8, entries_.max_size()));
-    std::uint32_t const number = sectionFor(section);
-    StoredText const ownKey = own(key);
-    entries_.emplace_back(number, ownKey, own(value));
+    std::uint32_t const number = addSection(section);
+    StoredText const heldKey = hold(key);
+    add(number, heldKey, hold(value));
 }
 
 void SettingsTable::create(std::wstring const& section, std::wstring const& key) {
@@ -153,7 +151,7 @@ void SettingsTable::setValue(std::wstring const& section, std::wstring const& ke
         wide->resize(value.size());
         std::copy(value.begin(), value.end(), wide->begin()); // without wmemcpy, see wideString
     } else {
-        stored = own(value);
+        stored = hold(value);
     }
 }
 
@@ -168,6 +166,8 @@ void SettingsTable::remove(std::wstring const& section, std::wstring const& key)
 
 void SettingsTable::removeEveryOther(std::wstring const& section) {
     SectionMatcher matches(*this, section);
+    // Of the entries before `i`, those that stay are the first `kept` ones, in their order; the
+    // entries from `i` on are where they were.
     std::size_t kept = 0;
     for (std::size_t i = 0; i < entries_.size(); ++i) {
         if (matches(entries_[i])) {
@@ -180,13 +180,13 @@ void SettingsTable::removeEveryOther(std::wstring const& section) {
     entries_.erase(entries_.begin() + static_cast<std::ptrdiff_t>(kept), entries_.end());
 }
 
-StoredText SettingsTable::own(std::wstring const& text) {
+StoredText SettingsTable::hold(std::wstring const& text) {
     std::wstring copy = wideString(text.data(), text.size());
     if (spare_.empty()) return StoredText(&strings_.emplace_back(std::move(copy)));
     *spare_.back() = std::move(copy);
-    StoredText const owned(spare_.back());
+    StoredText const held(spare_.back());
     spare_.pop_back();
-    return owned;
+    return held;
 }
 
 void SettingsTable::release(StoredText const& text) noexcept {
@@ -195,7 +195,7 @@ void SettingsTable::release(StoredText const& text) noexcept {
     std::wstring().swap(*wide);
     try {
         spare_.push_back(wide);
-    } catch (std::bad_alloc const&) { // It is not used again before the table is cleared.
+    } catch (std::bad_alloc const&) { // Its place stays unused until the table is cleared.
     }
 }
 
@@ -204,31 +204,34 @@ void SettingsTable::release(Entry const& entry) noexcept {
     release(entry.value);
 }
 
-std::uint32_t SettingsTable::sectionFor(std::wstring const& name) {
+/// The number of the last entry's section, if that has the same name; else of a section added here.
+std::uint32_t SettingsTable::addSection(std::wstring const& name) {
     if (!entries_.empty()) {
         std::uint32_t const last = entries_.back().section;
         if (sections_[last].str() == name) return last;
     }
     if (sections_.size() > 2 * entries_.size() + 64) dropUnusedSections();
-    return addSection(own(name));
+    return addSection(hold(name));
 }
 
-/// Keeps the names of sections that come and go from piling up.
+/// Keeps the names of sections that come and go from piling up. Nothing changes before all memory
+/// for it is there.
 void SettingsTable::dropUnusedSections() {
-    constexpr auto unused = static_cast<std::uint32_t>(-1);
-    std::vector<std::uint32_t> numbers(sections_.size(), unused);
+    std::vector<std::uint32_t> numbers(sections_.size(), NO_SECTION); // by the old number
     std::vector<StoredText> used;
     used.reserve(entries_.size());
+    // Entries before this one have new numbers, the others old ones. `numbers` has the new number
+    // of each section of an entry before this one; `used` has their names, by the new number.
     for (Entry& entry : entries_) {
         std::uint32_t& number = numbers[entry.section];
-        if (number == unused) {
+        if (number == NO_SECTION) {
             number = static_cast<std::uint32_t>(used.size());
             used.push_back(sections_[entry.section]);
         }
         entry.section = number;
     }
     for (std::size_t i = 0; i < sections_.size(); ++i) {
-        if (numbers[i] == unused) release(sections_[i]);
+        if (numbers[i] == NO_SECTION) release(sections_[i]);
     }
     sections_ = std::move(used);
     sectionFingerprints_.clear();

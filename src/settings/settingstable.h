@@ -1,9 +1,16 @@
-// The table behind a settings file: one ordered sequence of entries of section, key and value. A
-// flat file's entries all stand in the section with the empty name.
+// The table of a settings file: one ordered sequence of entries, each a section, a key and a value.
+// All entries of a flat file are in the section with the empty name.
 //
-// Look-ups are scans from the start of the table, and the first match counts. What makes them quick
-// is a column of 16-bit fingerprints beside the entries: only entries whose fingerprint is the one
-// looked for are compared.
+// Where the text is:
+//   hold     the table takes memory: the bytes of a file, or a copy of a string
+//   view     an entry refers to text in that memory, see StoredText
+//   release  no entry refers to a held string any more; the next text may have its place
+//   add      an entry or the name of a section goes to the end
+//   clear    the table gives up entries, names and memory
+//
+// A look-up scans the table from its start, and the first match counts. What makes that quick is a
+// column of 16-bit fingerprints beside the entries: the keys are compared only where the
+// fingerprint is the one looked for.
 #ifndef KORU_SETTINGS_SETTINGSTABLE_H
 #define KORU_SETTINGS_SETTINGSTABLE_H
 
@@ -41,26 +48,27 @@ public:
     /// @name Loading
     /// @{
 
-    /// Takes the bytes that the texts of the entries to come are views of, and makes room for about
-    /// as many entries as there may be. The table is empty.
+    /// Holds the bytes of a file, and makes room for about as many entries as they may have. The
+    /// table is empty.
     FileBytes const& hold(FileBytes bytes);
 
-    /// The held bytes. All text that is kept as bytes and is not empty lies in them.
-    std::string_view held() const { return bytes_.view(); }
+    /// The held bytes. Every view that is neither wide nor empty is of a part of them.
+    std::string_view heldBytes() const { return bytes_.view(); }
 
-    /// A text of the held bytes as make_wstring converts it: it ends at its first NUL, and what is
-    /// not well-formed is kept as the characters that it decodes to.
-    StoredText keep(std::string_view bytes);
+    /// A view of a part of the held bytes, as make_wstring converts it: the text ends at its first
+    /// NUL, and where it is not well-formed the table holds what it decodes to.
+    StoredText view(std::string_view bytes);
 
-    /// The same for a part of a line that is known to be plain, or not.
-    StoredText keep(std::string_view bytes, bool plain) {
-        return plain ? StoredText(bytes) : keep(bytes);
+    /// The same where it is known whether the line of that part is plain.
+    StoredText view(std::string_view bytes, bool plain) {
+        return plain ? StoredText(bytes) : view(bytes);
     }
 
-    /// Makes a section name known and returns its number for `Entry`.
+    /// Adds the name of a section and returns its number for `Entry`.
     std::uint32_t addSection(StoredText const& name);
 
-    void append(std::uint32_t section, StoredText const& key, StoredText const& value) {
+    /// Adds an entry of views.
+    void add(std::uint32_t section, StoredText const& key, StoredText const& value) {
         entries_.emplace_back(section, key, value);
     }
 
@@ -85,29 +93,32 @@ public:
 
     /// @}
 
-    /// Whether two entries stand in sections of equal names.
+    /// Whether two entries are in sections of equal names.
     bool sameSection(Entry const& a, Entry const& b) const;
 
     /// Calls `visit(entry)` for each entry of the section in order, as long as it returns true.
     template <class Visit>
     void eachOf(std::wstring const& section, Visit visit) const;
 
-    /// Adds an entry at the end.
+    /// Adds an entry whose text it holds.
     void add(std::wstring const& section, std::wstring const& key, std::wstring const& value);
 
-    /// Intended: looks at each entry in turn and removes it if it stands in the section, but never
-    /// looks at the one behind a removed entry, which has moved into its place.
+    /// Intended: looks at each entry in turn and removes it if it is in the section, but never
+    /// looks at the one after a removed entry, which has moved into its place.
     void removeEveryOther(std::wstring const& section);
 
 private:
-    /// Tells whether an entry stands in a section, comparing once for each run of entries.
+    /// The number of no section.
+    static constexpr std::uint32_t NO_SECTION = 0xFFFFFFFF;
+
+    /// Tells whether an entry is in a section, comparing once for each run of entries.
     class SectionMatcher;
 
     std::size_t find(std::wstring const& section, std::wstring const& key);
-    StoredText own(std::wstring const& text);
+    StoredText hold(std::wstring const& text);
     void release(StoredText const& text) noexcept;
     void release(Entry const& entry) noexcept;
-    std::uint32_t sectionFor(std::wstring const& name);
+    std::uint32_t addSection(std::wstring const& name);
     void dropUnusedSections();
     std::vector<std::uint32_t> sectionRanks() const;
     void completeFingerprints() noexcept;
@@ -116,11 +127,11 @@ private:
     std::vector<StoredText> sections_;
 
     FileBytes bytes_;
-    std::deque<std::wstring> strings_; // what wide texts refer to
-    std::vector<std::wstring*> spare_; // those of them that no text refers to any more
+    std::deque<std::wstring> strings_; // what wide views are of
+    std::vector<std::wstring*> spare_; // those of them that were released
 
-    // Each covers the first ones of the entries and section names, as many as a look-up saw and had
-    // memory for.
+    // Each belongs to the first entries or section names: to as many as there were, and as there
+    // was memory for, when a look-up needed them.
     std::vector<Fingerprint> fingerprints_;
     std::vector<std::uint32_t> sectionFingerprints_;
 };
@@ -142,7 +153,7 @@ public:
 private:
     SettingsTable const& table_;
     std::wstring const& name_;
-    std::uint32_t last_ = static_cast<std::uint32_t>(-1);
+    std::uint32_t last_ = NO_SECTION;
     bool matches_ = false;
 };
 
