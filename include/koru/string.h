@@ -19,8 +19,8 @@ namespace Koru {
 
 /// The empty strings of which `make_string` and `make_wstring` return copies. They exist before any
 /// function of the library can be called, even by the static constructors of an application.
-extern KORU_EXPORT const std::string _null_string;
-extern KORU_EXPORT const std::wstring _null_wstring;
+extern KORU_EXPORT std::string const _null_string;
+extern KORU_EXPORT std::wstring const _null_wstring;
 
 /// The number of characters before the first NUL; 0 for a null pointer.
 KORU_EXPORT std::size_t length(char const* s);

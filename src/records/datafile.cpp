@@ -3,8 +3,6 @@
 #include <algorithm>
 #include <stdexcept>
 
-#include <koru/string.h>
-
 #include "concurrency/cancellation.h"
 #include "file/fileguard.h"
 #include "file/filereader.h"

@@ -9,9 +9,9 @@
 #ifndef KORU_RECORDS_RECORDFILE_H
 #define KORU_RECORDS_RECORDFILE_H
 
-#include <koru/datafile.h>
-
 #include <memory>
+
+#include <koru/datafile.h>
 
 #include "file/filereader.h"
 #include "file/rewrite.h"

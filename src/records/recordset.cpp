@@ -3,10 +3,11 @@
 #include <algorithm>
 #include <functional>
 #include <new>
+#include <type_traits>
 
 #include <koru/string.h>
 
-#include "text/fold.h"
+#include "text/fingerprint.h"
 
 namespace Koru {
 

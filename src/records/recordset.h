@@ -7,15 +7,12 @@
 #ifndef KORU_RECORDS_RECORDSET_H
 #define KORU_RECORDS_RECORDSET_H
 
-#include <koru/datafile.h>
-
 #include <cstddef>
 #include <memory>
 #include <string>
-#include <type_traits>
 #include <vector>
 
-#include "text/fingerprint.h"
+#include <koru/datafile.h>
 
 namespace Koru {
 

@@ -5,6 +5,7 @@
 #include <limits>
 #include <new>
 
+#include "text/convert.h"
 #include "text/narrow.h"
 
 namespace Koru {

@@ -6,6 +6,8 @@
 #include <numeric>
 #include <utility>
 
+#include "text/convert.h"
+
 namespace Koru {
 
 void SettingsTable::clear() {

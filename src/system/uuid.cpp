@@ -4,7 +4,6 @@
 #include <array>
 #include <cstddef>
 #include <cstring>
-#include <ostream>
 
 #include "text/insert.h"
 #include "text/simd.h"

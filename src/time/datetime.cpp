@@ -1,7 +1,6 @@
 #include <koru/datetime.h>
 
 #include <cstdlib>
-#include <ostream>
 #include <stdexcept>
 
 #include "text/insert.h"
