@@ -5,11 +5,11 @@
 #include <cerrno>
 #include <limits>
 
+#include "concurrency/timeout.h"
+
 namespace Koru {
 
 namespace {
-
-constexpr unsigned long WITHOUT_LIMIT = 0xFFFFFFFFUL;
 
 /// Holds a POSIX mutex for a scope, which a cancelled wait leaves by unwinding too.
 class PosixGuard {

@@ -11,6 +11,7 @@
 #include <koru/string.h>
 
 #include "concurrency/cancellation.h"
+#include "concurrency/timeout.h"
 #include "file/fileguard.h"
 #include "file/openbuffer.h"
 
@@ -22,8 +23,6 @@ unsigned long const File::WRITE;
 unsigned long const File::BINARY;
 
 namespace {
-
-constexpr unsigned long WAIT_WITHOUT_LIMIT = 0xFFFFFFFFUL;
 
 std::ios::openmode _openMode(unsigned long mode) {
     std::ios::openmode result{};
@@ -89,7 +88,7 @@ void File::setMode(unsigned long mode) { mode_.store(mode, std::memory_order_rel
 bool File::lock() {
     return attempt(
         [this] {
-            lock_.lock(WAIT_WITHOUT_LIMIT);
+            lock_.lock(WITHOUT_LIMIT);
             return true;
         },
         [] { return false; });

@@ -24,7 +24,7 @@ wchar_t const _COLON = L':';
 
 namespace {
 
-constexpr int LONGEST_CHAIN = 40; // links, as many as the system follows
+constexpr int MOST_LINKS = 40; // in one path, as many as the system follows
 
 /// The resolved form of a path; the path itself where it has none.
 std::string _resolve(std::string const& path) {
@@ -76,7 +76,7 @@ std::string _resolveMissing(std::string const& path) {
     char buffer[PATH_MAX] = {};
     if (::realpath(path.c_str(), buffer) != nullptr) return buffer;
     // Links that lead back to themselves stay as they are.
-    int const links = errno == ELOOP ? 0 : LONGEST_CHAIN;
+    int const links = errno == ELOOP ? 0 : MOST_LINKS;
     // The C library leaves in the buffer how far it came before something was missing. Mostly that
     // is how the path begins, so there is nothing to resolve.
     std::size_t const size = std::strlen(buffer);

@@ -17,8 +17,8 @@ namespace Koru {
 
 namespace {
 
-constexpr std::size_t BUFFER_SIZE = 4096;
-static_assert(BUFFER_SIZE >= PATH_MAX, "realpath needs room for PATH_MAX bytes");
+constexpr std::size_t PATH_SIZE = 4096;
+static_assert(PATH_SIZE >= PATH_MAX, "realpath needs room for PATH_MAX bytes");
 
 /// The process's command line, open. Its thread cannot be cancelled meanwhile: opening, reading and
 /// closing are points of cancellation, and to be cancelled in any of them would leave a descriptor
@@ -54,8 +54,8 @@ private:
 
 /// Reads argv[0]. The arguments are separated by zero bytes, so as a string the buffer ends with
 /// the first of them. Intended: it ends at the first blank too.
-void _readFirstArgument(char (&argument)[BUFFER_SIZE]) {
-    std::size_t const size = CommandLine().readString(argument, BUFFER_SIZE - 1);
+void _readFirstArgument(char (&argument)[PATH_SIZE]) {
+    std::size_t const size = CommandLine().readString(argument, PATH_SIZE - 1);
     argument[size] = '\0';
     if (char* const blank = std::strchr(argument, ' ')) *blank = '\0';
 }
@@ -65,9 +65,9 @@ void _readFirstArgument(char (&argument)[BUFFER_SIZE]) {
 std::wstring System::getProcessFileName() {
     // Reading a file is a point of cancellation, so here is one.
     ::pthread_testcancel();
-    char argument[BUFFER_SIZE];
+    char argument[PATH_SIZE];
     _readFirstArgument(argument);
-    char resolved[BUFFER_SIZE];
+    char resolved[PATH_SIZE];
     std::memset(resolved, 0, sizeof resolved);
     // Intended: after a failure the buffer counts as it is; the C library leaves the part of the
     // path there that it could not get beyond, or nothing.

@@ -18,9 +18,9 @@ namespace Koru {
 
 namespace {
 
-constexpr std::size_t BLOCK = 64 * 1024; // bytes
+constexpr std::size_t BUFFER_SIZE = 64 * 1024; // bytes
 constexpr std::size_t LENGTH_SIZE = 4;
-constexpr std::uint64_t LONGEST = std::numeric_limits<std::uint32_t>::max();
+constexpr std::uint64_t LONGEST_FIELD = std::numeric_limits<std::uint32_t>::max();
 
 std::size_t _decodeLength(char const* bytes) {
     auto const byte = [bytes](std::size_t i) {
@@ -69,7 +69,7 @@ void _encodeKey(wchar_t const* key, std::size_t size, char* to) {
 /// Reads one record after the other. Memory is reused from one to the next.
 class RecordReader {
 public:
-    explicit RecordReader(FileReader& file) : file_(file), block_(new char[BLOCK]) {}
+    explicit RecordReader(FileReader& file) : file_(file), buffer_(new char[BUFFER_SIZE]) {}
 
     bool atEnd() { return at_ == filled_ && !fill(); }
 
@@ -80,21 +80,21 @@ public:
     }
 
 private:
-    /// Fetches what arrives next; false at the end of the file.
+    /// Fetches the bytes that arrive next; false at the end of the file.
     bool fill() {
         std::size_t const arrived = file_.arrived();
         if (file_.hasFailed()) file_.fail();
         if (arrived == 0) return false;
         at_ = 0;
-        filled_ = file_.take(block_.get(), std::min(arrived, BLOCK));
+        filled_ = file_.take(buffer_.get(), std::min(arrived, BUFFER_SIZE));
         return true;
     }
 
-    /// The next bytes where they are in the block; null when it does not have so many.
+    /// The next bytes, where they are in the buffer; null if it does not hold that many.
     char const* take(std::size_t size) {
         if (size > filled_ - at_) return nullptr;
         at_ += size;
-        return block_.get() + at_ - size;
+        return buffer_.get() + at_ - size;
     }
 
     void read(char* to, std::size_t size) {
@@ -160,7 +160,7 @@ private:
     }
 
     FileReader& file_;
-    std::unique_ptr<char[]> block_;
+    std::unique_ptr<char[]> buffer_;
     std::size_t at_ = 0;
     std::size_t filled_ = 0;
     std::vector<char> keyBytes_;
@@ -168,10 +168,10 @@ private:
     std::vector<unsigned char> data_;
 };
 
-/// Writes one record after the other into a block, which a sink gets whenever it is full.
+/// Writes one record after the other into a buffer, which a sink gets whenever it is full.
 class Writer {
 public:
-    Writer(char* block, Sink& sink) : block_(block), sink_(sink) {}
+    Writer(char* buffer, Sink& sink) : buffer_(buffer), sink_(sink) {}
 
     void write(DataFile::Record const& record) {
         std::wstring const& key = record.getKey();
@@ -182,29 +182,29 @@ public:
         writeData(data.data(), data.size());
     }
 
-    /// Gives what is in the block to the sink.
+    /// Gives the sink what is in the buffer.
     void flush() {
-        sink_.write(std::string_view(block_, filled_));
+        sink_.write(std::string_view(buffer_, filled_));
         filled_ = 0;
     }
 
 private:
-    /// The bytes that the block still takes; so many at least.
+    /// How many bytes the buffer still takes: at least as many as asked for.
     std::size_t room(std::size_t least) {
-        if (BLOCK - filled_ < least) flush();
-        return BLOCK - filled_;
+        if (BUFFER_SIZE - filled_ < least) flush();
+        return BUFFER_SIZE - filled_;
     }
 
     void writeLength(std::size_t length) {
         room(LENGTH_SIZE);
-        _encodeLength(length, block_ + filled_);
+        _encodeLength(length, buffer_ + filled_);
         filled_ += LENGTH_SIZE;
     }
 
     void writeKey(wchar_t const* key, std::size_t size) {
         while (size != 0) {
             std::size_t const step = std::min(size, room(2) / 2);
-            _encodeKey(key, step, block_ + filled_);
+            _encodeKey(key, step, buffer_ + filled_);
             filled_ += 2 * step;
             key += step;
             size -= step;
@@ -214,14 +214,14 @@ private:
     void writeData(unsigned char const* data, std::size_t size) {
         while (size != 0) {
             std::size_t const step = std::min(size, room(1));
-            std::memcpy(block_ + filled_, data, step);
+            std::memcpy(buffer_ + filled_, data, step);
             filled_ += step;
             data += step;
             size -= step;
         }
     }
 
-    char* block_;
+    char* buffer_;
     Sink& sink_;
     std::size_t filled_ = 0;
 };
@@ -234,18 +234,18 @@ void readRecords(FileReader& reader, RecordSet& records) {
 }
 
 RecordContent::RecordContent(RecordSet const& records)
-    : records_(records), block_(new char[BLOCK]) {
+    : records_(records), buffer_(new char[BUFFER_SIZE]) {
     if (sizeof(std::size_t) <= LENGTH_SIZE) return; // Memory holds nothing longer.
     RecordSet::Cursor cursor(records);
     while (DataFile::Record const* const record = cursor.next()) {
-        bool const fits = std::uint64_t{record->getKey().size()} <= LONGEST / 2 &&
-                          std::uint64_t{record->getData().size()} <= LONGEST;
+        bool const fits = std::uint64_t{record->getKey().size()} <= LONGEST_FIELD / 2 &&
+                          std::uint64_t{record->getData().size()} <= LONGEST_FIELD;
         if (!fits) throw std::runtime_error("failed to write to file");
     }
 }
 
 void RecordContent::writeTo(Sink& sink) const {
-    Writer writer(block_.get(), sink);
+    Writer writer(buffer_.get(), sink);
     RecordSet::Cursor cursor(records_);
     while (DataFile::Record const* const record = cursor.next()) writer.write(*record);
     writer.flush();

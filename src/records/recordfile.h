@@ -34,7 +34,7 @@ public:
 
 private:
     RecordSet const& records_;
-    std::unique_ptr<char[]> block_;
+    std::unique_ptr<char[]> buffer_;
 };
 
 } // namespace Koru

@@ -92,7 +92,7 @@ char* _put(char* to, char c) {
     return to + 1;
 }
 
-constexpr std::size_t LONGEST_TEXT = sizeof "65535-255-255 255:255:255";
+constexpr std::size_t TEXT_SIZE = sizeof "65535-255-255 255:255:255";
 
 /// Writes the given parts of a value and returns the end of what was written.
 char* _format(DateTime const& value, unsigned int parts, char* to) {
@@ -229,12 +229,12 @@ DateTime::operator long() const {
 }
 
 DateTime::operator std::string() const {
-    char text[LONGEST_TEXT];
+    char text[TEXT_SIZE];
     return std::string(text, _format(*this, parts_, text));
 }
 
 std::ostream& operator<<(std::ostream& os, DateTime const& value) {
-    char text[LONGEST_TEXT];
+    char text[TEXT_SIZE];
     insert(os, text, static_cast<std::size_t>(_format(value, value.parts_, text) - text));
     return os;
 }
