@@ -1,9 +1,10 @@
-// Thread cancellation, and the exceptions that it must not be taken for.
+// Thread cancellation, which must not be taken for an exception.
 //
-// glibc ends a cancelled thread by unwinding its stack with abi::__forced_unwind. To stop that
-// unwinding ends the process, and so does an unwinding that begins in a destructor. So whatever
-// catches everything lets it pass first, and destructors hold cancellation off. The unwinding
-// carries no object, which the sanitizer takes for a null reference wherever it is caught by name.
+// glibc ends a cancelled thread by unwinding its stack with abi::__forced_unwind. Code that catches
+// the unwinding and does not rethrow it ends the process, and so does an unwinding that begins in a
+// destructor. So code that catches everything lets the unwinding pass first, and destructors hold
+// cancellation off. The unwinding carries no object: a handler that names it binds a null
+// reference, of which the sanitizer would complain.
 #ifndef KORU_CONCURRENCY_CANCELLATION_H
 #define KORU_CONCURRENCY_CANCELLATION_H
 
@@ -24,8 +25,8 @@ private:
     int before_ = PTHREAD_CANCEL_ENABLE;
 };
 
-/// Runs a step and returns what it returns; where an exception leaves it, what `otherwise` returns,
-/// which runs while the exception is handled.
+/// Returns what the step returns. If it throws an exception, returns what `otherwise` returns; that
+/// runs while the exception is handled.
 template <class Step, class Otherwise>
 __attribute__((no_sanitize("undefined"))) auto attempt(Step step, Otherwise otherwise)
     -> decltype(step()) {
@@ -38,7 +39,7 @@ __attribute__((no_sanitize("undefined"))) auto attempt(Step step, Otherwise othe
     }
 }
 
-/// Runs a step, and `undo` where a cancellation unwinds it; exceptions pass without that.
+/// Runs a step, and then `undo` if a cancellation unwinds the step; an exception just passes.
 template <class Step, class Undo>
 __attribute__((no_sanitize("undefined"))) void undoIfCancelled(Step step, Undo undo) {
     try {
@@ -49,14 +50,14 @@ __attribute__((no_sanitize("undefined"))) void undoIfCancelled(Step step, Undo u
     }
 }
 
-/// Runs the callable for a destructor: nothing leaves it. (With cancellation held off there is no
-/// unwinding that would have to pass.)
+/// Runs the callable for a destructor: no exception leaves it. It may catch everything, since with
+/// cancellation held off no unwinding has to pass.
 template <class Callable>
 void quietly(Callable callable) noexcept {
     CancellationOff const guard;
     try {
         callable();
-    } catch (...) { // What is lost here, the caller could have had from close().
+    } catch (...) { // A caller who wants to see the exception calls close().
     }
 }
 

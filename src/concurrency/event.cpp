@@ -11,7 +11,7 @@ namespace Koru {
 
 namespace {
 
-/// Holds a POSIX mutex for a scope, which a cancelled wait leaves by unwinding too.
+/// Holds a POSIX mutex for a scope. The unwinding of a cancelled wait releases it too.
 class PosixGuard {
 public:
     explicit PosixGuard(pthread_mutex_t& mutex) : mutex_(mutex) { ::pthread_mutex_lock(&mutex_); }
@@ -23,8 +23,8 @@ private:
     pthread_mutex_t& mutex_;
 };
 
-/// Finds the moment so many seconds from now, or the last one that a time_t holds.
-/// @return false where the present does not fit a timeval, as on 32 bits after January 2038
+/// Finds the moment that many seconds from now, or the last one that a time_t can hold.
+/// @return false if the present does not fit a timeval, as on 32 bits after January 2038
 bool _findDeadline(unsigned long seconds, timespec& deadline) {
     timeval now;
     if (::gettimeofday(&now, nullptr) != 0) return false;
@@ -53,7 +53,7 @@ void Event::signal() {
     ::pthread_cond_signal(&condition_);
 }
 
-// Intended: one wait on the condition, whatever the flag says; the flag belongs to test().
+// Intended: waits on the condition once, whatever the flag is; only test() looks at the flag.
 int Event::wait(unsigned long timeout) {
     PosixGuard const guard(mutex_);
     if (timeout == WITHOUT_LIMIT || timeout == std::numeric_limits<unsigned long>::max()) {

@@ -14,7 +14,7 @@ constexpr useconds_t POLL_INTERVAL = 1000; // microseconds
 } // namespace
 
 Mutex::Mutex() {
-    // None of these can fail on Linux with the arguments given.
+    // With these arguments none of the calls can fail on Linux.
     pthread_mutexattr_t attributes;
     ::pthread_mutexattr_init(&attributes);
     ::pthread_mutexattr_settype(&attributes, PTHREAD_MUTEX_RECURSIVE);
@@ -22,7 +22,7 @@ Mutex::Mutex() {
     ::pthread_mutexattr_destroy(&attributes);
 }
 
-// Intended: the state is copied, not the kind; a copy of a held mutex is held.
+// Intended: copies the state, so a copy of a held mutex is held.
 Mutex::Mutex(Mutex const& other) { std::memcpy(&mutex_, &other.mutex_, sizeof mutex_); }
 
 Mutex& Mutex::operator=(Mutex const& other) {
@@ -37,7 +37,7 @@ Mutex::~Mutex() { ::pthread_mutex_destroy(&mutex_); }
 
 namespace {
 
-/// Goes on after a first try that failed. Intended: the last try, too, is followed by its sleep.
+/// Goes on after the first try has failed. Intended: sleeps after the last try too.
 void _poll(pthread_mutex_t& mutex, unsigned long timeout) {
     for (unsigned long tries = 0; tries < timeout;) {
         ::usleep(POLL_INTERVAL);
@@ -53,7 +53,7 @@ void Mutex::lock(unsigned long timeout) {
     if (!taken) _poll(mutex_, timeout);
 }
 
-// The only failure is that the caller does not hold the mutex; there is nothing to give back then.
+// Fails only if the caller does not hold the mutex; then there is nothing to release.
 void Mutex::unlock() { static_cast<void>(::pthread_mutex_unlock(&mutex_)); }
 
 bool Mutex::isLocked() const {

@@ -11,7 +11,7 @@ namespace Koru {
 
 namespace {
 
-// NOLINTNEXTLINE(performance-no-int-to-ptr): it is no address, only all bits set.
+// NOLINTNEXTLINE(performance-no-int-to-ptr): this is not an address, only all bits set.
 void* const FAILED = reinterpret_cast<void*>(static_cast<std::intptr_t>(-1));
 
 } // namespace

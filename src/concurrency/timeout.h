@@ -1,10 +1,10 @@
-// How long callers wait who do not want to give up.
+// The time-out of those who do not want to give up.
 #ifndef KORU_CONCURRENCY_TIMEOUT_H
 #define KORU_CONCURRENCY_TIMEOUT_H
 
 namespace Koru {
 
-/// The time-out that stands for none: an event waits without limit, a mutex for 49.7 days.
+/// An event takes this for no limit at all; a mutex gives up after 49.7 days.
 constexpr unsigned long WITHOUT_LIMIT = 0xFFFFFFFFUL;
 
 } // namespace Koru

@@ -17,7 +17,7 @@
 
 namespace Koru {
 
-// For callers who take their addresses; the values stand in the header.
+// For callers who take their addresses; the values are in the header.
 unsigned long const File::READ;
 unsigned long const File::WRITE;
 unsigned long const File::BINARY;
@@ -50,12 +50,12 @@ void File::open(unsigned long mode) {
     std::ios::openmode const openMode = _openMode(mode);
     errno = 0;
     bool const opened = openBuffer(*rdbuf(), name, openMode);
-    // Nothing else is a reason to truncate: a file may well be there when a descriptor or memory is
-    // lacking, or when a signal or the disk came in between.
+    // Only a missing file may be truncated: after any other failure, such as want of memory or of
+    // descriptors, a signal or a disk error, it may well exist.
     bool const missing = !is_open() && errno == ENOENT;
     if (!opened) setstate(std::ios::failbit);
     if (missing && (mode & WRITE) != 0) {
-        // The stream's mode for update does not create a file; the one for truncation does.
+        // Opening for update does not create a file; opening with truncation does.
         if (openBuffer(*rdbuf(), name, openMode | std::ios::trunc))
             clear();
         else
@@ -94,7 +94,7 @@ bool File::lock() {
         [] { return false; });
 }
 
-// Nothing can be thrown here.
+// Unlocking throws nothing.
 bool File::unlock() {
     lock_.unlock();
     return true;
@@ -106,7 +106,7 @@ bool File::exists(std::wstring const& path) {
     return ::access(make_string(path).c_str(), F_OK) == 0;
 }
 
-// Intended, here and below: what the calls say is not asked; only what exists afterwards counts.
+// Intended, here and below: the results of the calls are ignored; what exists afterwards counts.
 bool File::rename(std::wstring const& from, std::wstring const& to) {
     static_cast<void>(std::rename(make_string(from).c_str(), make_string(to).c_str()));
     return !exists(from) && exists(to);
@@ -115,7 +115,7 @@ bool File::rename(std::wstring const& from, std::wstring const& to) {
 bool File::remove(std::wstring const& path) {
     std::string const name = make_string(path);
     static_cast<void>(::chmod(name.c_str(), S_IRUSR | S_IWUSR));
-    // What was removed is not there; only a failure leaves a question.
+    // Only after a failure has to be asked whether the file exists.
     return std::remove(name.c_str()) == 0 || !exists(path);
 }
 

@@ -6,7 +6,7 @@
 
 namespace Koru {
 
-/// Takes the lock on construction and gives it back on every way out of the scope.
+/// Takes the lock, and gives it back whichever way the scope is left.
 class FileGuard {
 public:
     explicit FileGuard(File& file) : file_(file), held_(file.lock()) {}

@@ -16,17 +16,17 @@ constexpr std::size_t FIRST_CAPACITY_MOST = 1024 * 1024; // bytes
 
 bool _failed(std::streampos position) { return position == std::streampos(std::streamoff(-1)); }
 
-/// Whether the file is a pipe or the like. Asking for the position moves nothing and flushes
-/// nothing, so the answer is about the file alone.
+/// Whether the file is a pipe or the like. Asks for the position: that neither moves nor flushes
+/// anything, so it fails for no other reason.
 bool _hasNoStart(std::filebuf& buffer) {
     errno = 0;
     return _failed(buffer.pubseekoff(0, std::ios::cur, std::ios::in)) && errno == ESPIPE;
 }
 
 /// Moves the bytes to larger memory.
-/// @param needed  the least that it has to hold
-/// @param wished  what it had better hold; taken back step by step where memory is short
-/// @return how much it holds
+/// @param needed  the size that it must have at least
+/// @param wished  the size that it should have; tries smaller ones if memory is short
+/// @return the size that it has
 std::size_t _grow(FileBytes& bytes, std::size_t needed, std::size_t wished) {
     std::size_t capacity = std::max(needed, wished);
     std::unique_ptr<char[]> larger(new (std::nothrow) char[capacity]);
@@ -45,7 +45,7 @@ std::size_t _grow(FileBytes& bytes, std::size_t needed, std::size_t wished) {
 FileReader::FileReader(File& file) : file_(file) {
     file.flush();
     file.clear();
-    // Writes what flush did not, because the stream was in the fail state.
+    // Seeking also writes what flush left in the buffer, if the stream was in the fail state.
     bool const atStart = !_failed(file.rdbuf()->pubseekpos(0, std::ios::in));
     if (!atStart && !_hasNoStart(*file.rdbuf())) fail();
 }
@@ -75,8 +75,8 @@ FileBytes FileReader::readAll() {
     return bytes;
 }
 
-/// How many bytes are to come, as far as the system knows: pipes and the files of /proc do not
-/// tell, and what a file says may be more than memory holds.
+/// How many bytes are to come, as far as the system knows. Only a guess: pipes and the files of
+/// /proc do not tell, and a file may claim more than memory can hold.
 std::size_t FileReader::sizeHint() {
     std::streamsize const size = file_.rdbuf()->in_avail();
     return size <= 0 ? 0 : static_cast<std::size_t>(size);

@@ -7,8 +7,8 @@
 
 namespace Koru {
 
-/// Opens the buffer and tells whether that went well. Where memory for it runs out the standard
-/// library leaves the file open without a buffer; it is closed then, and the exception passes.
+/// Opens the buffer and returns whether it is open. If memory for it runs out, the standard library
+/// leaves the file open without a buffer; this closes the file and passes the exception on.
 inline bool openBuffer(std::filebuf& buffer, std::string const& name, std::ios::openmode mode) {
     try {
         return buffer.open(name, mode) != nullptr;

@@ -17,7 +17,7 @@
 
 namespace Koru {
 
-// Constants of the program text, so that they hold their values before any constructor runs.
+// Initialised at compile time, so they have their values before any constructor runs.
 wchar_t const _FSLASH = L'/';
 wchar_t const _BSLASH = L'\\';
 wchar_t const _COLON = L':';
@@ -26,21 +26,21 @@ namespace {
 
 constexpr int MOST_LINKS = 40; // in one path, as many as the system follows
 
-/// The resolved form of a path; the path itself where it has none.
+/// The resolved path, or the path itself if it cannot be resolved.
 std::string _resolve(std::string const& path) {
     char buffer[PATH_MAX];
     return ::realpath(path.c_str(), buffer) == nullptr ? path : std::string(buffer);
 }
 
-/// What a link leads to, as it is written there; an empty string for what is no link.
+/// The text of a link; an empty string if it is not a link.
 std::string _targetOf(std::string const& link) {
     char buffer[PATH_MAX];
     ssize_t const size = ::readlink(link.c_str(), buffer, sizeof buffer);
     return size <= 0 ? std::string() : std::string(buffer, static_cast<std::size_t>(size));
 }
 
-/// The length of the longest part of the path, cut before a slash, that exists. No component is
-/// looked up twice, and none after the first that is missing.
+/// The length of the longest existing part of the path that ends before a slash. Looks up each
+/// component once, up to the first that is missing.
 std::size_t _existingLength(std::string const& path) {
     std::size_t existing = 0;
     for (;;) {
@@ -56,9 +56,8 @@ std::string _below(std::string const& directory, std::string const& path) {
     return path[0] == '/' ? path : directory + '/' + path;
 }
 
-/// Resolves the part of the path that exists and appends the rest as it is. Where the first
-/// component that is missing is a link, the path goes on with what that leads to, so often at the
-/// most.
+/// Resolves the part of the path that exists and appends the rest as it is. If the first missing
+/// component is a link, its text takes its place; `links` says how often that is done at most.
 std::string _resolveExisting(std::string path, int links) {
     for (;; --links) {
         std::size_t const existing = _existingLength(path);
@@ -70,15 +69,15 @@ std::string _resolveExisting(std::string path, int links) {
     }
 }
 
-/// Resolves an absolute path, of which the end may be missing: most files that a program writes do
-/// not exist yet.
+/// Resolves an absolute path whose end may be missing: a file that is to be written often does not
+/// exist yet.
 std::string _resolveMissing(std::string const& path) {
     char buffer[PATH_MAX] = {};
     if (::realpath(path.c_str(), buffer) != nullptr) return buffer;
-    // Links that lead back to themselves stay as they are.
+    // Links that lead back to themselves are not followed.
     int const links = errno == ELOOP ? 0 : MOST_LINKS;
-    // The C library leaves in the buffer how far it came before something was missing. Mostly that
-    // is how the path begins, so there is nothing to resolve.
+    // The C library leaves in the buffer how far it got before something was missing. If the path
+    // begins with just that, there is nothing to resolve in it.
     std::size_t const size = std::strlen(buffer);
     bool const isBeginning = size != 0 && path.compare(0, size, buffer) == 0 &&
                              (path.size() == size || path[size] == '/');
@@ -93,7 +92,7 @@ std::string _workingDirectory() {
 
 std::wstring _relativeToExecutable(std::wstring const& text) {
     std::wstring directory = System::getProcessFileName();
-    directory.resize(directory.rfind(_FSLASH) + 1); // to nothing when there is no slash
+    directory.resize(directory.rfind(_FSLASH) + 1); // empty if there is no slash
     std::string path = make_string(directory) + make_string(text);
     if (path[0] != '/') path = _below(_workingDirectory(), path);
     return make_wstring(_resolveMissing(path));
@@ -101,9 +100,9 @@ std::wstring _relativeToExecutable(std::wstring const& text) {
 
 bool _isSeparator(wchar_t c) { return c == _FSLASH || c == _BSLASH; }
 
-/// The directory part of a path, which ends after its last separator, with one forward slash at its
-/// beginning and between any two segments. It is written to memory that is there: to append one
-/// character after the other takes longer.
+/// The directory part of a path, which ends after its last separator: a forward slash at its start
+/// and one after each segment. Writes into a string of the full size, since appending character by
+/// character takes longer.
 std::wstring _directory(wchar_t const* part, wchar_t const* end) {
     std::wstring directory(static_cast<std::size_t>(end - part) + 1, _FSLASH);
     wchar_t* last = &directory[0];
@@ -127,8 +126,8 @@ File::Path::Path(std::wstring const& text) {
     std::wstring resolved;
     wchar_t const* path = text.data();
     wchar_t const* end = path + size;
-    // Intended: decided before backslashes count as slashes, so a path that begins with one is
-    // relative. An absolute path is taken as it is.
+    // Intended: backslashes do not count as slashes yet, so a path that begins with one is
+    // relative. An absolute path is not resolved.
     if (*path != _FSLASH) {
         resolved = _relativeToExecutable(text);
         path = resolved.data();
@@ -150,7 +149,7 @@ File::Path::Path(char const* text) : Path(make_wstring(text)) {}
 
 File::Path::Path(Path const& other) = default;
 
-// All or nothing: what needs memory is done before this path changes.
+// All or nothing: the copy takes its memory before this path changes.
 File::Path& File::Path::operator=(Path const& other) {
     Path copy(other);
     volume_.swap(copy.volume_);
@@ -197,13 +196,13 @@ bool _equalAsWholes(File::Path const& a, File::Path const& b) {
 } // namespace
 
 bool operator==(File::Path const& a, File::Path const& b) {
-    // This class's own parts, as the conversion takes them, whatever overrides there are.
+    // Not the overrides of a derived class: the conversion does not ask them either.
     std::wstring const* const parts[][2] = {
         {&a.File::Path::getVolume(), &b.File::Path::getVolume()},
         {&a.File::Path::getDirectory(), &b.File::Path::getDirectory()},
         {&a.File::Path::getName(), &b.File::Path::getName()}};
     for (auto const& [x, y] : parts) {
-        // Parts that begin at different places have to be compared as a whole.
+        // Parts of different sizes may still make the same whole.
         if (x->size() != y->size()) return _equalAsWholes(a, b);
         if (compare(*x, *y) != 0) return false;
         if (length(*x) != x->size()) return true; // Nothing counts after a NUL.

@@ -14,7 +14,7 @@ namespace Koru {
 
 namespace {
 
-/// A descriptor. Where it refuses a block, the content ends.
+/// Writes to a descriptor, up to the first block that the system refuses.
 class DescriptorSink : public Sink {
 public:
     explicit DescriptorSink(int descriptor) : descriptor_(descriptor) {}
@@ -56,13 +56,13 @@ void _check(File const& file) {
     if (file.fail()) throw std::runtime_error("failed to write to file");
 }
 
-/// A stream. Where it refuses a block, that is thrown.
+/// Writes to a stream, and throws when it refuses a block.
 class StreamSink : public Sink {
 public:
     explicit StreamSink(File& file) : file_(file) {}
 
     void write(std::string_view block) override {
-        // Unformatted: `<<` would find the inserter that counts with 8 bits.
+        // Not `<<`: that finds the library's own inserter, which counts with 8 bits.
         file_.write(block.data(), static_cast<std::streamsize>(block.size()));
         _check(file_);
     }
@@ -76,7 +76,7 @@ void _write(File& file, Content const& content) {
     file.clear();
     StreamSink sink(file);
     content.writeTo(sink);
-    // What stays in the stream's buffer has not met a full disk yet.
+    // A full disk shows only when the stream's buffer is written.
     file.flush();
     _check(file);
 }
@@ -89,14 +89,14 @@ void rewrite(File& file, Content const& content) {
     std::string const name = make_string(wideName);
     file.File::close();
     try {
-        // A file that cannot be deleted may still be writable. Opening it for update would keep
-        // what is longer than the new content.
+        // A file that cannot be deleted may still be writable. It is emptied, since opening it for
+        // update would keep what the old content has more than the new one.
         if (!File::remove(wideName)) static_cast<void>(::truncate(name.c_str(), 0) == 0);
         file.File::open(mode);
     } catch (std::exception const&) {
-        // Mostly the old file's place is gone. But it may be that between the old file and the new
-        // one there is no memory for a stream, which the C library does not tell from any other
-        // reason. The content is at hand, so it goes to the disk all the same.
+        // The old file is gone and the stream cannot open a new one, perhaps only because memory
+        // is short: the C library does not say. So the content is saved without a stream. Where
+        // the file's directory has gone, saving fails too, and nothing is lost by trying.
         _save(name, content);
         throw;
     }

@@ -1,4 +1,4 @@
-// The life cycle that the structured files share: load on open, write anew on close.
+// The life cycle that the structured files share: load on open, rewrite on close.
 #ifndef KORU_FILE_REWRITE_H
 #define KORU_FILE_REWRITE_H
 
@@ -12,26 +12,25 @@
 
 namespace Koru {
 
-/// What takes the new content of a file.
+/// Takes the new content of a file.
 class Sink {
 public:
     virtual ~Sink() = default;
     virtual void write(std::string_view block) = 0;
 };
 
-/// The new content of a file. All memory that writing it takes is there before the old file is
-/// touched.
+/// The new content of a file. It has all the memory that it needs before the old file is touched.
 class Content {
 public:
     virtual ~Content() = default;
 
-    /// Writes all of it, block by block and in order, as often as it is asked for.
+    /// Writes all of the content, block by block. May be called again.
     virtual void writeTo(Sink& sink) const = 0;
 };
 
-/// Opens the file, discards what was held in memory and calls `load(reader)` if the mode says so. A
-/// cancellation leaves the mode 0: the destructor, which the same unwinding may call next, would
-/// write what was loaded so far over the file.
+/// Opens the file, discards what was held in memory and calls `load(reader)` if the mode has READ.
+/// A cancellation sets the mode to 0: the same unwinding may call the destructor next, which must
+/// not write half a file over the whole one.
 template <class Discard, class Load>
 void openAndLoad(File& file, unsigned long mode, Discard discard, Load load) {
     FileGuard const guard(file);
@@ -46,14 +45,13 @@ void openAndLoad(File& file, unsigned long mode, Discard discard, Load load) {
         [&file] { file.File::setMode(0); });
 }
 
-/// Deletes the file and writes it anew with the mode of now; it is open afterwards.
+/// Deletes the file and writes the content to a new one, which is open afterwards in the same mode.
 /// @throws std::runtime_error "failed to write to file", and what File::open and close throw
 void rewrite(File& file, Content const& content);
 
-/// Writes the file anew if the mode says so, then discards what was held in memory and closes.
-/// `prepare` gives the content, ready to be written, before the old file is touched: what fails for
-/// want of memory fails while the old file is still there. A cancelled thread ends before or after
-/// this, but not between the old file and the new one, nor between that and the empty memory.
+/// Rewrites the file if the mode has WRITE, then discards what was held in memory and closes.
+/// `prepare` returns the content ready to be written, so if memory is short, it fails while the old
+/// file is still there. A thread is cancelled before all of this or after it, never in between.
 template <class Prepare, class Discard>
 void writeBackAndClose(File& file, Prepare prepare, Discard discard) {
     FileGuard const guard(file);

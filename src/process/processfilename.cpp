@@ -20,9 +20,9 @@ namespace {
 constexpr std::size_t PATH_SIZE = 4096;
 static_assert(PATH_SIZE >= PATH_MAX, "realpath needs room for PATH_MAX bytes");
 
-/// The process's command line, open. Its thread cannot be cancelled meanwhile: opening, reading and
-/// closing are points of cancellation, and to be cancelled in any of them would leave a descriptor
-/// behind, or end the process where the close is part of a destructor.
+/// The open command line of the process. While it is open, the thread is not cancelled: opening,
+/// reading and closing are cancellation points, and a cancellation there would leave the descriptor
+/// open, or end the process if it unwinds from a destructor.
 class CommandLine {
 public:
     CommandLine() : descriptor_(::open("/proc/self/cmdline", O_RDONLY | O_CLOEXEC)) {}
@@ -32,7 +32,7 @@ public:
         if (descriptor_ >= 0) ::close(descriptor_);
     }
 
-    /// Fills the buffer up to a zero byte at least and returns how much of it that took.
+    /// Reads until a zero byte has arrived or the buffer is full; returns how many bytes it read.
     std::size_t readString(char* buffer, std::size_t size) const {
         std::size_t filled = 0;
         while (filled < size) {
@@ -52,8 +52,8 @@ private:
     int descriptor_;
 };
 
-/// Reads argv[0]. The arguments are separated by zero bytes, so as a string the buffer ends with
-/// the first of them. Intended: it ends at the first blank too.
+/// Reads argv[0]. Zero bytes separate the arguments, so the first one ends the string. Intended: so
+/// does the first blank.
 void _readFirstArgument(char (&argument)[PATH_SIZE]) {
     std::size_t const size = CommandLine().readString(argument, PATH_SIZE - 1);
     argument[size] = '\0';
@@ -63,14 +63,14 @@ void _readFirstArgument(char (&argument)[PATH_SIZE]) {
 } // namespace
 
 std::wstring System::getProcessFileName() {
-    // Reading a file is a point of cancellation, so here is one.
+    // Reading a file is a cancellation point, so this function is one.
     ::pthread_testcancel();
     char argument[PATH_SIZE];
     _readFirstArgument(argument);
     char resolved[PATH_SIZE];
     std::memset(resolved, 0, sizeof resolved);
-    // Intended: after a failure the buffer counts as it is; the C library leaves the part of the
-    // path there that it could not get beyond, or nothing.
+    // Intended: after a failure the buffer counts as it is. The C library leaves in it the path up
+    // to the component that failed, or nothing.
     static_cast<void>(::realpath(argument, resolved) != nullptr);
     return make_wstring(resolved);
 }

@@ -16,7 +16,7 @@ namespace Koru {
 DataFile::Record::Record() = default;
 
 DataFile::Record::Record(std::wstring const& key, std::vector<unsigned char> const& data) {
-    // This class's own: an override cannot be called yet.
+    // Overrides cannot be called yet.
     Record::setKey(key);
     Record::setData(data);
 }
@@ -33,7 +33,7 @@ void DataFile::Record::setKey(std::wstring const& key) {
     auto const isBlank = [](wchar_t c) { return c == L' ' || c == L'\t' || c == L'\n'; };
     auto const first = std::find_if_not(key.begin(), key.end(), isBlank);
     auto const end = std::find_if_not(key.rbegin(), key.rend(), isBlank).base();
-    // Intended: a key of nothing else stays as it is.
+    // Intended: a key of nothing but blanks stays as it is.
     bool const onlyBlanks = first == key.end();
     auto const from = onlyBlanks ? key.begin() : first;
     auto const to = onlyBlanks ? key.end() : end;
@@ -68,7 +68,7 @@ void DataFile::close() {
 }
 
 unsigned long DataFile::size() const {
-    // The lock is the one thing that looking changes.
+    // Taking the lock is the only change.
     FileGuard const guard(const_cast<DataFile&>(*this));
     return records_->size();
 }
@@ -79,7 +79,7 @@ DataFile::Record& DataFile::operator[](unsigned long index) {
     return records_->handOut(index);
 }
 
-// Intended: a record with an equal key stays as it is, and nobody is told.
+// Intended: if there is a record with an equal key, nothing happens and nothing is reported.
 void DataFile::insert(Record const& record) {
     FileGuard const guard(*this);
     if (!records_->holds(record.getKey())) records_->add(record);

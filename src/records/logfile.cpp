@@ -10,12 +10,12 @@
 
 namespace Koru {
 
-// For callers who take its address; the value stands in the header.
+// For callers who take its address; the value is in the header.
 unsigned int const LogFile::MAX_LINE_LENGTH;
 
 namespace {
 
-/// One line on standard output. Not with `<<`, which counts with 8 bits here.
+/// Writes one line to standard output. Not with `<<`: in this namespace that counts with 8 bits.
 void _report(std::string const& name) {
     std::string const line = "File::open() failed to open " + name;
     std::cout.write(line.data(), static_cast<std::streamsize>(line.size())) << std::endl;
@@ -30,11 +30,11 @@ LogFile::LogFile(File::Path const& path) : File(static_cast<std::wstring>(path))
 LogFile::~LogFile() = default;
 
 void LogFile::open(unsigned int mode) {
-    // Creates the file or empties it, as the mode says, and checks that it can be opened.
+    // This creates or empties the file, as the mode says, and checks that it can be opened.
     File::open(mode);
     File::close();
     std::string const name = make_string(getName());
-    // Intended: the mode is not set again, and without WRITE the append open fails.
+    // Intended: the mode stays 0, and without WRITE the file is not opened again.
     std::ios::openmode const append =
         (mode & WRITE) != 0 ? std::ios::out | std::ios::app : std::ios::openmode{};
     if (openBuffer(*rdbuf(), name, append)) return;

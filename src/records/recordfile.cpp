@@ -37,12 +37,12 @@ void _encodeLength(std::size_t length, char* to) {
     to[3] = byte(3);
 }
 
-/// The second byte of each pair, sign-extended. Intended: also where that is a character beyond
-/// 0x7FFFFFFF.
+/// Decodes each pair as its second byte, sign-extended. Intended: bytes from 0x80 on become
+/// characters beyond 0x7FFFFFFF.
 void _decodeKey(char const* pairs, std::size_t size, wchar_t* to) {
     wchar_t* const end = to + size;
     for (; end - to >= 8; pairs += 16, to += 8) {
-        // Twice in 32 bits, of which the highest 8 remain.
+        // Each pair twice in 32 bits; the shift leaves its second byte.
         __m128i const eight = load16(pairs);
         store16(to, _mm_srai_epi32(_mm_unpacklo_epi16(eight, eight), 24));
         store16(to + 4, _mm_srai_epi32(_mm_unpackhi_epi16(eight, eight), 24));
@@ -50,10 +50,10 @@ void _decodeKey(char const* pairs, std::size_t size, wchar_t* to) {
     for (; to != end; pairs += 2) *to++ = static_cast<signed char>(pairs[1]);
 }
 
-/// Zero and the character's low 8 bits for each.
+/// Encodes each character as a zero and its low 8 bits.
 void _encodeKey(wchar_t const* key, std::size_t size, char* to) {
     wchar_t const* const end = key + size;
-    // In 16 bits with the lower byte zero, which packing does not cut.
+    // The low 8 bits of each character as the high byte of 16 bits, which packing keeps.
     auto const four = [](wchar_t const* characters) {
         return _mm_srai_epi32(_mm_slli_epi32(load16(characters), 24), 16);
     };
@@ -66,7 +66,7 @@ void _encodeKey(wchar_t const* key, std::size_t size, char* to) {
     }
 }
 
-/// Reads one record after the other. Memory is reused from one to the next.
+/// Reads one record after the other, and reuses its memory for the next.
 class RecordReader {
 public:
     explicit RecordReader(FileReader& file) : file_(file), buffer_(new char[BUFFER_SIZE]) {}
@@ -114,8 +114,8 @@ private:
         return _decodeLength(bytes.data());
     }
 
-    /// Reads as many bytes as a length says, which is only believed as far as bytes arrive: memory
-    /// grows with them, to twice as much at the most.
+    /// Reads as many bytes as a length says. The length may be wrong, so memory grows only as bytes
+    /// arrive, to twice their number at most.
     template <class Byte>
     void gather(std::vector<Byte>& bytes, std::size_t length) {
         constexpr std::size_t firstStep = 64 * 1024;
@@ -141,7 +141,7 @@ private:
     void readData() {
         std::size_t const length = readLength();
         if (char const* const bytes = take(length)) {
-            // Of the same type, which makes it one copy.
+            // The cast makes the types equal, so that assign copies all at once.
             auto const* const data = reinterpret_cast<unsigned char const*>(bytes);
             data_.assign(data, data + length);
         } else {
@@ -149,7 +149,7 @@ private:
         }
     }
 
-    /// After an odd length a zero is read.
+    /// Decodes the key. Intended: a zero follows the bytes of an odd length.
     void decodeKey(char const* bytes, std::size_t length) {
         std::size_t const pairs = length / 2;
         std::size_t const characters = pairs + length % 2;

@@ -5,7 +5,7 @@
 //     D       4 bytes, little-endian: length of the data in bytes
 //     data    D bytes
 //
-// for one record after the other; docs/formats.md draws it. There is nothing else in the file.
+// for each record, and nothing else; docs/formats.md draws it.
 #ifndef KORU_RECORDS_RECORDFILE_H
 #define KORU_RECORDS_RECORDFILE_H
 
@@ -24,10 +24,10 @@ namespace Koru {
 /// @throws std::invalid_argument "zero length key"
 void readRecords(FileReader& reader, RecordSet& records);
 
-/// The records as bytes, in blocks of one size however large they are.
+/// The records as bytes, written through one buffer however large they are.
 class RecordContent : public Content {
 public:
-    /// @throws std::runtime_error "failed to write to file" when a length does not fit its field
+    /// @throws std::runtime_error "failed to write to file" if a length does not fit its field
     explicit RecordContent(RecordSet const& records);
 
     void writeTo(Sink& sink) const override;

@@ -15,7 +15,7 @@ namespace {
 
 constexpr std::size_t FIRST_CAPACITY = 64; // records
 
-// The number of a record that was handed out. Its key may have changed, so it is always compared.
+// The fingerprint of a record that was handed out: its key may change, so it is always compared.
 constexpr Fingerprint HANDED_OUT = 0xFFFF;
 
 Fingerprint _fingerprint(std::wstring const& key) {
@@ -25,8 +25,12 @@ Fingerprint _fingerprint(std::wstring const& key) {
 
 } // namespace
 
-/// Memory for a fixed number of records. Lists never grow beyond that, so only making a block and
-/// copying a record allocate.
+/// Memory for a fixed number of records. Its lists have that capacity from the start, so memory is
+/// allocated only for a new block and for the content of a record.
+///
+/// At any time `records_` is in the order of addresses, and `numbers_` has the fingerprint of each
+/// at the same index. Of the slots before `used_` each has a record or is in `spare_`; those from
+/// `used_` on never had one.
 class RecordSet::Block {
 public:
     explicit Block(std::size_t capacity) : capacity_(capacity), slots_(new Slot[capacity]) {
@@ -64,6 +68,8 @@ public:
         return i;
     }
 
+    /// Adds a record to a block that has room. Only making the record can throw, and that comes
+    /// first: the slot is still free then, and the lists are as they were.
     template <class... Parts>
     void add(Parts const&... parts) {
         void* const slot = spare_.empty() ? &slots_[used_] : spare_.back();
@@ -97,11 +103,11 @@ private:
 
     std::size_t capacity_;
     std::unique_ptr<Slot[]> slots_;
-    std::size_t used_ = 0; // slots from here on never held a record
+    std::size_t used_ = 0;
     std::vector<void*> spare_;
     std::vector<Record*> records_;
     std::vector<Fingerprint> numbers_;
-    bool handedOut_ = false; // whether any number says so
+    bool handedOut_ = false; // whether any number is HANDED_OUT
 };
 
 RecordSet::RecordSet() = default;
@@ -141,7 +147,7 @@ RecordSet::Record const* RecordSet::Cursor::next() {
 }
 
 RecordSet::Block& RecordSet::blockWithRoom() {
-    // Mostly there is room where the last record went.
+    // There usually is room where the last record went.
     if (last_ == nullptr || !last_->hasRoom()) last_ = &firstWithRoom();
     return *last_;
 }

@@ -1,9 +1,9 @@
 // The records that a record file holds, in the order of their addresses.
 //
-// They are kept in a few blocks of memory, each twice as large as all before it, and each with a
-// list of its records in the order of their addresses. So a position is found within a few steps,
-// and a new record mostly goes to the end of a list. A column of fingerprints beside each list
-// makes looking for a key quick.
+// They are kept in a few blocks of memory. Each block is as large as all before it together and has
+// a list of its records in the order of their addresses, so a position is found in a few steps, and
+// a new record usually goes to the end of a list. Beside each list is a column of fingerprints,
+// which makes looking for a key quick.
 #ifndef KORU_RECORDS_RECORDSET_H
 #define KORU_RECORDS_RECORDSET_H
 
@@ -27,14 +27,13 @@ public:
 
     std::size_t size() const { return size_; }
 
-    /// The record at a position below the size, for a caller who may change its key at any time
-    /// from now on.
+    /// The record at a position below the size. The caller may change its key at any later time.
     Record& handOut(std::size_t position);
 
-    /// Whether a record with an equal key is held.
+    /// Whether there is a record with an equal key.
     bool holds(std::wstring const& key) const { return find(key).block != nullptr; }
 
-    /// Holds a copy of the record, or a record made of key and data (which see for what is thrown).
+    /// Adds a copy of the record, or a record made of key and data. Throws what making it throws.
     void add(Record const& record);
     void add(std::wstring const& key, std::vector<unsigned char> const& data);
 
@@ -59,11 +58,11 @@ private:
     Block& firstWithRoom();
 
     std::vector<std::unique_ptr<Block>> blocks_; // in the order of their addresses
-    Block* last_ = nullptr;                      // the one that got the last record
+    Block* last_ = nullptr;                      // where the last record was added
     std::size_t size_ = 0;
 };
 
-/// Gives one record after the other, of a set that does not change meanwhile, and then null.
+/// Returns one record after the other, then null. The set must not change in between.
 class RecordSet::Cursor {
 public:
     explicit Cursor(RecordSet const& set) : set_(set) {}

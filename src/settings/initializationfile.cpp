@@ -14,7 +14,7 @@
 
 namespace Koru {
 
-// For callers who take its address; the value stands in the header.
+// For callers who take its address; the value is in the header.
 unsigned long const InitializationFile::MAX_LINE_LENGTH;
 
 namespace {

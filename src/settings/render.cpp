@@ -26,9 +26,8 @@ char* _encode(std::wstring const& text, char* to) {
     return ascii ? narrow(text.data(), text.size(), to) : encode(text.data(), text.size(), to);
 }
 
-/// The bytes that the text takes at the most: with a header wherever there may be one, since
-/// whether two names are the same depends on the C locale, which another thread may change
-/// meanwhile.
+/// How many bytes the text takes at most. Counts a header wherever there may be one: whether two
+/// names are equal depends on the C locale, and another thread may change that before the writing.
 std::uint64_t _bound(SettingsTable const& table, Headers headers) {
     std::uint64_t size = 0;
     Entry const* previous = nullptr;
@@ -43,8 +42,8 @@ std::uint64_t _bound(SettingsTable const& table, Headers headers) {
     return size;
 }
 
-/// Writes to memory that is large enough. What follows upon each other in the bytes of the file
-/// that was read as it does in the new text, as most lines do, is copied at once.
+/// Writes to memory that is large enough. Most lines of the new text follow each other just as they
+/// do in the bytes of the file that was read; such a run is copied at once.
 class Writer {
 public:
     Writer(char* to, std::string_view file) : to_(to), fileEnd_(file.data() + file.size()) {}
@@ -90,7 +89,7 @@ private:
     }
 
     char* to_;
-    char const* run_ = nullptr; // bytes of the file that are still to be copied
+    char const* run_ = nullptr; // bytes of the file that still have to be copied
     char const* runEnd_ = nullptr;
     char const* fileEnd_;
 };

@@ -12,10 +12,10 @@
 
 namespace Koru {
 
-/// One line for each entry, in the order of the table: key, "=" and value.
+/// What the text has besides a line for each entry: key, "=" and value.
 enum class Headers {
     NONE,
-    OF_SECTIONS ///< before the first entry of each run in one section: "[", its name and "]"
+    OF_SECTIONS ///< a line "[", name, "]" before each run of entries in one section
 };
 
 /// The whole file as one block.

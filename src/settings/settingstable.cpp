@@ -25,8 +25,8 @@ FileBytes const& SettingsTable::hold(FileBytes bytes) {
     bytes_ = std::move(bytes);
     try {
         entries_.reserve(bytes_.size / usualLine);
-    } catch (
-        std::exception const&) { // Memory is short, or the guess absurd: they get it one by one.
+    } catch (std::exception const&) {
+        // Memory is short, or the guess is absurd: adding the entries will show.
     }
     return bytes_;
 }
@@ -63,7 +63,7 @@ void SettingsTable::sort() {
     std::stable_sort(entries_.begin(), entries_.end(), byRank);
 }
 
-/// The place of each section's name in the order of all names; equal names have the same.
+/// The rank of each section's name among all names; equal names have the same rank.
 std::vector<std::uint32_t> SettingsTable::sectionRanks() const {
     std::vector<std::uint32_t> order(sections_.size());
     std::iota(order.begin(), order.end(), 0U);
@@ -84,7 +84,7 @@ std::size_t SettingsTable::find(std::wstring const& section, std::wstring const&
     auto const isAt = [this, &matches, &key](std::size_t i) {
         return matches(entries_[i]) && areEqual(entries_[i].key, key);
     };
-    constexpr std::size_t few = 4; // Comparing so many takes less than making the column.
+    constexpr std::size_t few = 4; // They are compared sooner than the column is made.
     if (entries_.size() > few && entries_.size() != fingerprints_.size()) completeFingerprints();
     if (!fingerprints_.empty()) {
         // An empty name, as a flat file's section has it, mixes to 0.
@@ -108,7 +108,7 @@ void SettingsTable::completeFingerprints() noexcept {
             sectionFingerprints_.push_back(mixFingerprint(0, sections_[i]));
         }
         fingerprints_.resize(entries_.size());
-    } catch (std::bad_alloc const&) { // Look-ups do without.
+    } catch (std::bad_alloc const&) { // Look-ups do without the column.
         return;
     }
     for (std::size_t i = known; i != entries_.size(); ++i) {
@@ -124,7 +124,7 @@ bool SettingsTable::sameSection(Entry const& a, Entry const& b) const {
 
 void SettingsTable::add(std::wstring const& section, std::wstring const& key,
                         std::wstring const& value) {
-    // First what takes memory, so that a failure leaves the entries as they are.
+    // Memory comes first, so that a failure leaves the entries as they are.
     if (entries_.size() == entries_.capacity())
         entries_.reserve(std::min(2 * entries_.size() + 8, entries_.max_size()));
     std::uint32_t const number = addSection(section);
@@ -168,8 +168,7 @@ void SettingsTable::remove(std::wstring const& section, std::wstring const& key)
 
 void SettingsTable::removeEveryOther(std::wstring const& section) {
     SectionMatcher matches(*this, section);
-    // Of the entries before `i`, those that stay are the first `kept` ones, in their order; the
-    // entries from `i` on are where they were.
+    // The first `kept` entries are those before `i` that stay; from `i` on, none has moved yet.
     std::size_t kept = 0;
     for (std::size_t i = 0; i < entries_.size(); ++i) {
         if (matches(entries_[i])) {
@@ -206,7 +205,7 @@ void SettingsTable::release(Entry const& entry) noexcept {
     release(entry.value);
 }
 
-/// The number of the last entry's section, if that has the same name; else of a section added here.
+/// Returns the number of the last entry's section if it has the same name, else adds a section.
 std::uint32_t SettingsTable::addSection(std::wstring const& name) {
     if (!entries_.empty()) {
         std::uint32_t const last = entries_.back().section;
@@ -216,14 +215,14 @@ std::uint32_t SettingsTable::addSection(std::wstring const& name) {
     return addSection(hold(name));
 }
 
-/// Keeps the names of sections that come and go from piling up. Nothing changes before all memory
-/// for it is there.
+/// Keeps the names of sections that come and go from piling up. Takes all its memory before it
+/// changes anything.
 void SettingsTable::dropUnusedSections() {
     std::vector<std::uint32_t> numbers(sections_.size(), NO_SECTION); // by the old number
     std::vector<StoredText> used;
     used.reserve(entries_.size());
-    // Entries before this one have new numbers, the others old ones. `numbers` has the new number
-    // of each section of an entry before this one; `used` has their names, by the new number.
+    // Entries before this one have new numbers, the others old ones. Of each section seen so far
+    // `numbers` has the new number, and `used` has the name at that number.
     for (Entry& entry : entries_) {
         std::uint32_t& number = numbers[entry.section];
         if (number == NO_SECTION) {

@@ -99,7 +99,7 @@ public:
     template <class Visit>
     void eachOf(std::wstring const& section, Visit visit) const;
 
-    /// Adds an entry whose text it holds.
+    /// Adds an entry, and holds its text.
     void add(std::wstring const& section, std::wstring const& key, std::wstring const& value);
 
     /// Intended: looks at each entry in turn and removes it if it is in the section, but never
@@ -126,11 +126,11 @@ private:
     std::vector<StoredText> sections_;
 
     FileBytes bytes_;
-    std::deque<std::wstring> strings_; // what wide views are of
+    std::deque<std::wstring> strings_; // the held strings
     std::vector<std::wstring*> spare_; // those of them that were released
 
-    // Each belongs to the first entries or section names: to as many as there were, and as there
-    // was memory for, when a look-up needed them.
+    // Those of the first entries and of the first section names: of as many as there were when a
+    // look-up last needed them and had memory for them.
     std::vector<Fingerprint> fingerprints_;
     std::vector<std::uint32_t> sectionFingerprints_;
 };

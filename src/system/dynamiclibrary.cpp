@@ -34,7 +34,7 @@ bool DynamicLibrary::load() {
 }
 
 bool DynamicLibrary::unload() {
-    // Intended: whether the loader was content is not asked.
+    // Intended: the result does not matter.
     if (handle_ != nullptr) static_cast<void>(::dlclose(handle_));
     handle_ = nullptr;
     return true;

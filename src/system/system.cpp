@@ -16,7 +16,7 @@ namespace {
 
 constexpr std::size_t NAME_SIZE = 128;
 
-/// The host's name with a zero byte behind it, also when it fills all bytes; empty on failure.
+/// The host's name, which ends with a zero byte even if it fills NAME_SIZE; empty on failure.
 class HostName {
 public:
     HostName() : bytes_(), known_(::gethostname(bytes_.data(), NAME_SIZE) == 0) {
@@ -25,7 +25,7 @@ public:
 
     char const* bytes() const { return bytes_.data(); }
 
-    /// What the resolver knows of it, in static storage; null when that is nothing.
+    /// The resolver's entry for the host, in static storage; null if it has none.
     hostent const* entry() const { return known_ ? ::gethostbyname(bytes()) : nullptr; }
 
 private:

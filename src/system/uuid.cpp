@@ -40,13 +40,13 @@ Text _format(unsigned char const (&bytes)[16]) {
     return text;
 }
 
-/// Where the characters are from one to another.
+/// All bits of each character from `first` to `last`, none of the others.
 __m128i _areFrom(char first, char last, __m128i c) {
     return _mm_and_si128(_mm_cmpgt_epi8(c, _mm_set1_epi8(static_cast<char>(first - 1))),
                          _mm_cmplt_epi8(c, _mm_set1_epi8(static_cast<char>(last + 1))));
 }
 
-/// Reads sixteen digits as eight bytes, if that is what they are.
+/// Reads sixteen digits as eight bytes; false if they are not all digits.
 bool _read(__m128i c, unsigned char* to) {
     __m128i const letters = _areFrom('a', 'f', _mm_or_si128(c, _mm_set1_epi8('a' ^ 'A')));
     if (highBits(_mm_or_si128(_areFrom('0', '9', c), letters)) != ALL_BYTES) return false;
@@ -58,7 +58,7 @@ bool _read(__m128i c, unsigned char* to) {
     return true;
 }
 
-/// Reads the text form.
+/// Reads text with the hyphens in their usual places.
 bool _readUsual(char const* text, unsigned char* to) {
     if (text[8] != '-' || text[13] != '-' || text[18] != '-' || text[23] != '-') return false;
     auto const four = [text](std::size_t place) {
@@ -70,8 +70,8 @@ bool _readUsual(char const* text, unsigned char* to) {
            _read(_mm_setr_epi32(four(19), four(24), four(28), four(32)), to + 8);
 }
 
-/// Reads text with hyphens anywhere. Intended: what they leave free at the end keeps what stood
-/// there and has to be digits too.
+/// Reads text with hyphens anywhere. Intended: the other characters move up into their places, and
+/// what remains at the end has to be digits too.
 bool _readAnyhow(char const* text, unsigned char* to) {
     Text digits;
     std::copy_n(text, TEXT_SIZE, digits.data());
@@ -92,7 +92,7 @@ Uuid::Uuid(std::vector<unsigned char> const& bytes) : bytes_() {
 }
 
 Uuid::Uuid(std::string const& text) : bytes_() {
-    // A NUL before the end of 36 characters is no digit.
+    // A NUL within the 36 characters is not a digit, so it needs no check here.
     if (text.size() < TEXT_SIZE || text.c_str()[TEXT_SIZE] != '\0') return;
     std::array<unsigned char, 16> bytes;
     if (_readUsual(text.data(), bytes.data()) || _readAnyhow(text.data(), bytes.data())) {

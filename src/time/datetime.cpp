@@ -7,7 +7,7 @@
 
 namespace Koru {
 
-// For callers who take their addresses; the values stand in the header.
+// For callers who take their addresses; the values are in the header.
 unsigned int const DateTime::DATE;
 unsigned int const DateTime::TIME;
 
@@ -15,12 +15,12 @@ namespace {
 
 constexpr int SECONDS_PER_HOUR = 3600;
 
-/// The offset of the local zone at a moment, east of UTC, in whole hours. gmtime leaves tm_isdst 0:
-/// the hour of daylight saving is not in it.
+/// The offset of the local zone at a moment, in whole hours east of UTC, without the hour of
+/// daylight saving: gmtime sets tm_isdst to 0.
 std::int16_t _offsetHours(std::time_t moment) {
     std::tm* const utc = std::gmtime(&moment);
     if (utc == nullptr) return 0;
-    // As 64 bits, since at the edges of time_t mktime may fail and the difference not fit.
+    // In 64 bits: near the limits of time_t mktime may fail, and the difference may not fit.
     std::int64_t const difference = std::int64_t{moment} - std::int64_t{std::mktime(utc)};
     return static_cast<std::int16_t>(difference / SECONDS_PER_HOUR);
 }
@@ -38,7 +38,7 @@ bool _has(std::string const& text, std::size_t position, char c) {
 
 bool _isDigit(char c) { return c >= '0' && c <= '9'; }
 
-/// The number that strtol finds in part of a text, which goes up to that position at least.
+/// The number that strtol finds in `size` characters of a text that is not shorter than `position`.
 template <std::size_t size>
 inline long _number(std::string const& text, std::size_t position) {
     if (position + size <= text.size()) {
@@ -51,7 +51,7 @@ inline long _number(std::string const& text, std::size_t position) {
         }
         if (plain) return number;
     }
-    // Signs, blanks and missing digits are left to it.
+    // strtol deals with signs, blanks and missing digits.
     return std::strtol(text.substr(position, size).c_str(), nullptr, 10);
 }
 
@@ -78,7 +78,7 @@ void _readTime(DateTime& value, std::string const& text) {
     value.setSecond(static_cast<unsigned char>(_number<2>(text, start + 6)));
 }
 
-/// Writes a number with leading zeros; a wider one is not cut.
+/// Writes a number with leading zeros, or all its digits if they are more than `width`.
 char* _put(char* to, unsigned int number, unsigned int width) {
     unsigned int digits = width;
     for (unsigned int rest = number / (width == 4 ? 10000U : 100U); rest != 0; rest /= 10) ++digits;
@@ -94,7 +94,7 @@ char* _put(char* to, char c) {
 
 constexpr std::size_t TEXT_SIZE = sizeof "65535-255-255 255:255:255";
 
-/// Writes the given parts of a value and returns the end of what was written.
+/// Writes the given parts of a value and returns the end of the text.
 char* _format(DateTime const& value, unsigned int parts, char* to) {
     if ((parts & DateTime::DATE) != 0) {
         to = _put(_put(to, value.getYear(), 4), '-');
@@ -129,7 +129,7 @@ DateTime::DateTime(std::tm const& time, unsigned int parts) : DateTime() {
         minute_ = static_cast<std::uint8_t>(time.tm_min);
         second_ = static_cast<std::uint8_t>(time.tm_sec);
     }
-    // The time may stand in the storage that the calls below share: it is not looked at any more.
+    // `time` may be in the storage that the C library's calls share: it is not used from here on.
     std::time_t const moment = std::mktime(&copy);
     if ((parts & TIME) != 0) offset_ = _offsetHours(moment);
     parts_ = static_cast<std::uint8_t>(parts);
@@ -260,14 +260,14 @@ int _days(DateTime const& value) {
     return (value.getYear() * 12 + value.getMonth()) * 31 + value.getDay();
 }
 
-/// How two values with different fields compare: by their epoch seconds, which take a conversion of
-/// the first and then of the second unless the fields decide beyond doubt. Apart, so that values
-/// with the same fields do without the registers that it takes.
+/// How two values with different fields compare: by their epoch seconds. Converts both, first `a`,
+/// unless the fields decide beyond doubt. Not inlined: values with the same fields are compared
+/// sooner without the registers that this takes.
 [[gnu::noinline]] int _orderInTime(DateTime const& a, DateTime const& b) {
     if (_isRegular(a) && _isRegular(b)) {
-        // Seven of these days are four of the calendar at least, where they lie across February,
-        // and so more than 72 hours from one time of day to any other. A zone is less than 25 hours
-        // from UTC (POSIX), so from the one moment to the other it shifts by less than 50.
+        // Seven of these days are at least four calendar days, namely at the end of February, and
+        // so more than 72 hours between any times of day. A zone is less than 25 hours from UTC
+        // (POSIX), so it shifts by less than 50 hours between the two moments.
         constexpr int beyondDoubt = 7;
         int const difference = _days(a) - _days(b);
         if (difference >= beyondDoubt || difference <= -beyondDoubt) return difference;

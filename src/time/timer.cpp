@@ -13,22 +13,22 @@ namespace Koru {
 
 namespace {
 
-/// Seconds since the epoch as a 32-bit float. Intended: rounded, but once only. The sum is exact
-/// enough as a double, and the volatile object takes away what a register of the x87 holds beyond.
+/// Seconds since the epoch as a 32-bit float. Intended: rounded, but only once. A double holds the
+/// sum precisely enough, and storing to a volatile object drops what an x87 register has beyond it.
 float _total(Timer const& timer) {
     double const exact = timer.getSeconds() + timer.getMilliseconds() / double{1000.0F};
     float volatile const rounded = static_cast<float>(exact);
     return rounded;
 }
 
-/// Whether a number that is written to the stream has no sign, no padding and no separators.
+/// Whether the stream writes a number without a sign, padding and separators.
 bool _writesPlainly(std::ostream const& os) {
     return os.width() == 0 && (os.flags() & std::ios::showpos) == 0 &&
            os.getloc() == std::locale::classic();
 }
 
-/// Writes seconds as the stream does that has just been told how. Whole numbers, as those of our
-/// time all are, need none of what the C library does for fractions.
+/// Writes seconds as the stream does, which is set to three decimals. Whole numbers do not need the
+/// C library for that, and the difference of two floats of our time has no fraction.
 void _write(std::ostream& os, float seconds) {
     char text[sizeof "4294967295.000"];
     bool const isWhole = !std::signbit(seconds) && seconds < 4e9F && seconds == std::trunc(seconds);
