@@ -10,7 +10,7 @@
 namespace Koru {
 
 /// The units that a block has room for.
-constexpr std::size_t BLOCK = 1024;
+constexpr std::size_t BLOCK = 2048;
 
 /// How a block on the stack is aligned, and with it the frame of who calls what is below: that
 /// keeps vectors on the stack and does not align it on 32 bits, where callers of the library may
