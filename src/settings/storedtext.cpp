@@ -42,9 +42,6 @@ std::size_t _difference(std::string_view a, std::string_view b) {
     return i;
 }
 
-/// Whether every locale lowers a character as ASCII has it.
-bool _isUndisputed(char c) { return c > 0 && c != 'I'; }
-
 /// All else. Apart, so that what mostly decides does without what this takes.
 __attribute__((noinline)) int _compareFolded(StoredText const& a, StoredText const& b) {
     return a.withCursor(
@@ -61,7 +58,7 @@ int compare(StoredText const& a, StoredText const& b) {
     if (i == y.size()) return i == x.size() ? 0 : 1;
     if (i == x.size()) return -1;
     // Mostly the first two characters that differ decide.
-    bool const decided = _isUndisputed(x[i]) && _isUndisputed(y[i]) && lower(x[i]) != lower(y[i]);
+    bool const decided = isUndisputed(x[i]) && isUndisputed(y[i]) && lower(x[i]) != lower(y[i]);
     return decided ? static_cast<int>(lower(x[i]) - lower(y[i])) : _compareFolded(a, b);
 }
 

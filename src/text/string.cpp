@@ -42,55 +42,64 @@ int compare(wchar_t const* a, wchar_t const* b) {
 
 namespace {
 
-/// How four pairs of characters compare; in each lane all bits or none.
+/// Whether four characters are the same, and not NUL.
+bool _areSame(__m128i a, __m128i b) {
+    __m128i const isNul = _mm_cmpeq_epi32(a, _mm_setzero_si128());
+    return highBits(_mm_andnot_si128(isNul, _mm_cmpeq_epi32(a, b))) == ALL_BYTES;
+}
+
+/// How four pairs of characters compare.
 struct FourPairs {
     FourPairs(__m128i a, __m128i b) {
+        __m128i const zero = _mm_setzero_si128();
         __m128i const caseBit = _mm_set1_epi32(0x20);
         __m128i const difference = _mm_xor_si128(a, b);
         __m128i const lowered = _mm_or_si128(a, caseBit);
-        __m128i const letters = _mm_and_si128(_mm_cmpgt_epi32(lowered, _mm_set1_epi32('a' - 1)),
-                                              _mm_cmplt_epi32(lowered, _mm_set1_epi32('z' + 1)));
-        __m128i const otherCase = _mm_and_si128(letters, _mm_cmpeq_epi32(difference, caseBit));
-        __m128i const zero = _mm_setzero_si128();
-        same = _mm_andnot_si128(_mm_cmpeq_epi32(a, zero),
-                                _mm_or_si128(otherCase, _mm_cmpeq_epi32(difference, zero)));
-        disputed = _mm_and_si128(otherCase, _mm_cmpeq_epi32(lowered, _mm_set1_epi32('i')));
+        __m128i const place = _mm_sub_epi32(lowered, _mm_set1_epi32('a'));
+        __m128i const behindZ = _mm_subs_epu16(place, _mm_set1_epi32('z' - 'a'));
+        __m128i const ignored = _mm_and_si128(_mm_cmpeq_epi32(behindZ, zero), caseBit);
+        __m128i const isEqual = _mm_cmpeq_epi32(_mm_andnot_si128(ignored, difference), zero);
+        same = _mm_andnot_si128(_mm_cmpeq_epi32(a, zero), isEqual);
+        disputed = _mm_and_si128(_mm_cmpeq_epi32(lowered, _mm_set1_epi32('i')), difference);
     }
 
-    __m128i same;     ///< equal but for the case of an ASCII letter, and not NUL
-    __m128i disputed; ///< I and i
+    __m128i same;     ///< all bits where equal but for the case of an ASCII letter, and not NUL
+    __m128i disputed; ///< not zero where I and i meet, among those that are the same
 };
 
-/// How many characters two texts are sure to have in common, case aside; the last three are not
-/// looked at.
-std::size_t _commonPrefix(wchar_t const* a, wchar_t const* b, std::size_t size) {
-    __m128i disputed = _mm_setzero_si128();
+/// Compares texts whose first characters differ. Apart, since most comparisons end before and then
+/// do without the stack that this takes.
+[[gnu::noinline]] int _compareCases(wchar_t const* a, wchar_t const* b, std::size_t size) {
+    __m128i const zero = _mm_setzero_si128();
+    __m128i disputed = zero;
     std::size_t i = 0;
     for (; size - i >= 4; i += 4) {
         FourPairs const pairs(load16(a + i), load16(b + i));
+        if (highBits(pairs.same) != ALL_BYTES) break;
         disputed = _mm_or_si128(disputed, pairs.disputed);
-        std::uint32_t const others = highBits(pairs.same) ^ ALL_BYTES;
-        if (others != 0) {
-            i += static_cast<std::size_t>(__builtin_ctz(others)) / sizeof *a;
-            break;
-        }
     }
-    bool const agreed = highBits(disputed) == 0 || lower(L'I') == L'i';
-    return agreed ? i : 0;
+    bool const agreed = highBits(_mm_cmpeq_epi32(disputed, zero)) == ALL_BYTES;
+    if (!agreed && lower(L'I') != L'i') i = 0;
+    return compareFolded(WideCursor(a + i), WideCursor(b + i));
 }
 
 } // namespace
 
 int compare(std::wstring const& a, std::wstring const& b) {
-    // Most names differ at their start, before vectors are worth their while.
-    wchar_t const* x = a.c_str();
-    wchar_t const* y = b.c_str();
-    for (wchar_t const* const few = x + 2; *x == *y && x != few; ++x, ++y) {
-        if (*x == 0) return 0;
+    wchar_t const* const x = a.c_str();
+    wchar_t const* const y = b.c_str();
+    std::size_t const size = std::min(a.size(), b.size());
+    std::size_t i = 0;
+    if (x[0] == y[0]) {
+        while (size - i >= 4 && _areSame(load16(x + i), load16(y + i))) i += 4;
     }
-    if (*x != *y && lower(*x) != lower(*y)) return static_cast<int>(lower(*x) - lower(*y));
-    std::size_t const common = _commonPrefix(a.data(), b.data(), std::min(a.size(), b.size()));
-    return compareFolded(WideCursor(a.c_str() + common), WideCursor(b.c_str() + common));
+    for (; x[i] == y[i]; ++i) {
+        if (x[i] == 0) return 0;
+    }
+    // Mostly the first two characters that differ decide.
+    if (isUndisputed(x[i]) && isUndisputed(y[i]) && lower(x[i]) != lower(y[i]))
+        return static_cast<int>(lower(x[i]) - lower(y[i]));
+    return _compareCases(x + i, y + i, size - i);
 }
 
 // What is too long for any string is want of memory too: callers have one failure to know.
