@@ -1,48 +1,42 @@
-#include <tmmintrin.h>
-
 #include <algorithm>
-#include <array>
 #include <cstdint>
-#include <cstring>
 
+#include "text/compress.h"
 #include "text/convert.h"
-#include "text/simd.h"
+#include "text/narrow.h"
 #include "text/utf8.h"
 
 namespace Koru {
 
 namespace {
 
-/// Widens sixteen bytes.
-void _widen16(__m128i bytes, wchar_t* to) {
+/// Writes eight 16-bit values as characters.
+void _widen8(__m128i values, wchar_t* to) {
     __m128i const zero = _mm_setzero_si128();
-    __m128i const low = _mm_unpacklo_epi8(bytes, zero);
-    __m128i const high = _mm_unpackhi_epi8(bytes, zero);
-    store16(to, _mm_unpacklo_epi16(low, zero));
-    store16(to + 4, _mm_unpackhi_epi16(low, zero));
-    store16(to + 8, _mm_unpacklo_epi16(high, zero));
-    store16(to + 12, _mm_unpackhi_epi16(high, zero));
+    store16(to, _mm_unpacklo_epi16(values, zero));
+    store16(to + 4, _mm_unpackhi_epi16(values, zero));
 }
 
-/// Widens four bytes if all are ASCII.
-bool _widen4(char const* s, wchar_t* to) {
-    std::uint32_t bytes;
-    std::memcpy(&bytes, s, sizeof bytes);
-    if ((bytes & 0x80808080U) != 0) return false;
+/// Writes sixteen bytes as characters.
+void _widen16(__m128i bytes, wchar_t* to) {
     __m128i const zero = _mm_setzero_si128();
-    __m128i const low = _mm_unpacklo_epi8(_mm_cvtsi32_si128(static_cast<int>(bytes)), zero);
-    store16(to, _mm_unpacklo_epi16(low, zero));
+    _widen8(_mm_unpacklo_epi8(bytes, zero), to);
+    _widen8(_mm_unpackhi_epi8(bytes, zero), to + 8);
+}
+
+/// Writes four bytes as characters if all are ASCII.
+bool _widen4(char const* s, wchar_t* to) {
+    __m128i const zero = _mm_setzero_si128();
+    __m128i const bytes = narrow4(s);
+    if (highBits(bytes) != 0) return false;
+    store16(to, _mm_unpacklo_epi16(_mm_unpacklo_epi8(bytes, zero), zero));
     return true;
 }
 
-/// How far a decoding has come. Taken and returned by value, which keeps it in registers.
-struct Progress {
-    char const* s;
-    wchar_t* to;
-};
+using Decoding = Progress<char, wchar_t>;
 
 /// Decodes the characters that begin within one step by the plain rule.
-Progress _decodeStep(Progress at, char const* end) {
+Decoding _decodeStep(Decoding at, char const* end) {
     char const* const stop = at.s + std::min(end - at.s, STEP);
     while (at.s < stop) {
         if (stop - at.s >= 4 && _widen4(at.s, at.to)) {
@@ -58,7 +52,7 @@ Progress _decodeStep(Progress at, char const* end) {
 }
 
 /// Decodes whole steps of ASCII while there is room for another.
-Progress _decodeAscii(Progress at, char const* end, wchar_t const* full) {
+Decoding _decodeAscii(Decoding at, char const* end, wchar_t const* full) {
     for (; end - at.s >= STEP && full - at.to >= STEP; at.s += STEP, at.to += STEP) {
         __m128i const bytes = load16(at.s);
         if (highBits(bytes) != 0) break;
@@ -71,43 +65,17 @@ Progress _decodeAscii(Progress at, char const* end, wchar_t const* full) {
 // there; then those where none begins are squeezed out. That takes no branch on the text and no
 // look at one character before the next can be found.
 
-/// The shuffle that moves those of four 16-bit values that a mask keeps to the front and widens
-/// them; for the values of the register's lower and of its upper half.
-struct Squeeze {
-    alignas(16) std::array<std::array<std::array<std::int8_t, 16>, 16>, 2> shuffles{};
-    std::array<std::uint8_t, 16> kept{};
-};
-
-constexpr Squeeze _makeSqueeze() {
-    constexpr std::int8_t zero = -1;
-    Squeeze squeeze;
-    for (std::size_t half = 0; half < 2; ++half) {
-        for (std::size_t mask = 0; mask < 16; ++mask) {
-            auto& shuffle = squeeze.shuffles[half][mask];
-            for (auto& from : shuffle) from = zero;
-            std::size_t kept = 0;
-            for (std::size_t i = 0; i < 4; ++i) {
-                if ((mask >> i & 1) == 0) continue;
-                shuffle[4 * kept] = static_cast<std::int8_t>(8 * half + 2 * i);
-                shuffle[4 * kept + 1] = static_cast<std::int8_t>(8 * half + 2 * i + 1);
-                ++kept;
-            }
-            squeeze.kept[mask] = static_cast<std::uint8_t>(kept);
-        }
-    }
-    return squeeze;
-}
-
-constexpr Squeeze SQUEEZE = _makeSqueeze();
-
-/// Writes those of four 16-bit values that the lowest bits of `keep` tell and returns the end of
+/// Writes those of eight 16-bit values that the lowest bits of `keep` tell, and returns the end of
 /// what was written.
-template <std::size_t half>
-__attribute__((target("ssse3"))) wchar_t* _squeeze4(__m128i values, std::uint32_t keep,
-                                                    wchar_t* to) {
-    keep &= 0xF;
-    store16(to, _mm_shuffle_epi8(values, load16(SQUEEZE.shuffles[half][keep].data())));
-    return to + SQUEEZE.kept[keep];
+__attribute__((target("ssse3"))) wchar_t* _compress8(__m128i values, std::uint32_t keep,
+                                                     wchar_t* to) {
+    keep &= 0xFF;
+    // A value at place i consists of the bytes 2 * i and 2 * i + 1.
+    __m128i const places = placesOf(keep);
+    __m128i const twice = _mm_add_epi8(places, places);
+    __m128i const bytes = _mm_or_si128(_mm_unpacklo_epi8(twice, twice), _mm_set1_epi16(0x0100));
+    _widen8(_mm_shuffle_epi8(values, bytes), to);
+    return to + COMPRESSION.kept[keep];
 }
 
 /// What the sixteen bytes mean where a character begins: its value is top << 12 | middle << 6 |
@@ -129,9 +97,6 @@ Bits _bits(char const* s, __m128i bytes) {
     };
     __m128i const several = atLeast(0xC0);
     __m128i const three = atLeast(0xE0);
-    auto const either = [](__m128i condition, __m128i yes, __m128i no) {
-        return _mm_or_si128(_mm_and_si128(condition, yes), _mm_andnot_si128(condition, no));
-    };
     __m128i const lead = _mm_and_si128(bytes, _mm_set1_epi8(0x1F));
     return {_mm_and_si128(three, bytes), _mm_and_si128(several, either(three, second, lead)),
             either(three, third, either(several, second, bytes))};
@@ -158,10 +123,8 @@ __attribute__((target("ssse3"))) wchar_t* _decodeThrees(char const* s, __m128i b
     // What stands where no character begins is not zero either: it is a continuation byte.
     __m128i const zeros = _mm_or_si128(_mm_cmpeq_epi16(first, zero), _mm_cmpeq_epi16(last, zero));
     if (highBits(zeros) != 0) return nullptr;
-    to = _squeeze4<0>(first, leads, to);
-    to = _squeeze4<1>(first, leads >> 4, to);
-    to = _squeeze4<0>(last, leads >> 8, to);
-    return _squeeze4<1>(last, leads >> 12, to);
+    to = _compress8(first, leads, to);
+    return _compress8(last, leads >> 8, to);
 }
 
 /// Decodes a step of four characters of four bytes and returns the end of what was written; null if
@@ -194,7 +157,7 @@ struct Shape {
 };
 
 /// Decodes whole steps of well-formed text while there is room for another.
-__attribute__((target("ssse3"))) Progress _decodeMixed(Progress at, char const* end,
+__attribute__((target("ssse3"))) Decoding _decodeMixed(Decoding at, char const* end,
                                                        wchar_t const* full) {
     constexpr std::uint32_t fours = 0x1111; // the leads of a step of nothing but fours
     // The continuation bytes that the last characters still own: bit i for byte i from here.
@@ -227,7 +190,7 @@ __attribute__((target("ssse3"))) Progress _decodeMixed(Progress at, char const* 
 
 wchar_t* decodeBlock(char const*& s, char const* end, wchar_t* to, bool shuffle) {
     wchar_t const* const full = to + BLOCK;
-    Progress at = {s, to};
+    Decoding at = {s, to};
     while (at.s != end && full - at.to >= STEP) {
         at = _decodeAscii(at, end, full);
         if (shuffle && end - at.s > STEP) at = _decodeMixed(at, end, full);
@@ -245,11 +208,8 @@ std::size_t countLeads(char const* s, std::size_t size) {
         __m128i const leads = _mm_cmpgt_epi8(load16(s), _mm_set1_epi8(-0x41));
         counts = _mm_add_epi32(counts, _mm_sad_epu8(_mm_sub_epi8(zero, leads), zero));
     }
-    auto const low = static_cast<std::uint32_t>(_mm_cvtsi128_si32(counts));
-    auto const high = static_cast<std::uint32_t>(_mm_cvtsi128_si32(_mm_srli_si128(counts, 8)));
-    return std::size_t{low} + high + static_cast<std::size_t>(std::count_if(s, end, [](char c) {
-               return static_cast<signed char>(c) >= -0x40;
-           }));
+    auto const begins = [](char c) { return static_cast<signed char>(c) >= -0x40; };
+    return sum4(counts) + static_cast<std::size_t>(std::count_if(s, end, begins));
 }
 
 } // namespace Koru

@@ -1,12 +1,10 @@
-#include <tmmintrin.h>
-
 #include <algorithm>
-#include <array>
 #include <cstdint>
 #include <cstring>
 
+#include "text/compress.h"
 #include "text/convert.h"
-#include "text/simd.h"
+#include "text/narrow.h"
 #include "text/utf8.h"
 
 namespace Koru {
@@ -36,37 +34,19 @@ char* _encodeOne(std::int32_t c, char* to) {
     return to;
 }
 
-/// Narrows sixteen characters. Where one is not from 1 to 127, the byte is not above zero.
-__m128i _narrow16(wchar_t const* s) {
-    return _mm_packus_epi16(_mm_packs_epi32(load16(s), load16(s + 4)),
-                            _mm_packs_epi32(load16(s + 8), load16(s + 12)));
-}
-
-bool _holdsEverywhere(__m128i condition) { return highBits(condition) == ALL_BYTES; }
-
-bool _areAboveZero(__m128i bytes) {
-    return _holdsEverywhere(_mm_cmpgt_epi8(bytes, _mm_setzero_si128()));
-}
-
-/// Narrows four characters if all are from 1 to 127.
+/// Writes four characters as bytes if all are ASCII, and not NUL.
 bool _narrow4(wchar_t const* s, char* to) {
-    __m128i const twice = _mm_packs_epi32(load16(s), load16(s));
-    __m128i const bytes = _mm_packus_epi16(twice, twice);
-    if (!_areAboveZero(bytes)) return false;
+    __m128i const bytes = narrow4(s);
+    if (!areAscii(bytes)) return false;
     int const four = _mm_cvtsi128_si32(bytes);
     std::memcpy(to, &four, sizeof four);
     return true;
 }
 
-/// How far an encoding has come. Taken and returned by value, since any byte that is written
-/// through a reference to it might change it, as far as the compiler knows.
-struct Progress {
-    wchar_t const* s;
-    char* to;
-};
+using Encoding = Progress<wchar_t, char>;
 
 /// Encodes the characters of one step by the plain rule.
-Progress _encodeStep(Progress at, wchar_t const* end) {
+Encoding _encodeStep(Encoding at, wchar_t const* end) {
     wchar_t const* const stop = at.s + std::min(end - at.s, STEP);
     while (at.s != stop) {
         if (stop - at.s >= 4 && _narrow4(at.s, at.to)) {
@@ -81,60 +61,33 @@ Progress _encodeStep(Progress at, wchar_t const* end) {
 }
 
 /// Encodes whole steps of ASCII while `to` is not beyond `last`.
-Progress _encodeAscii(Progress at, wchar_t const* end, char const* last) {
+Encoding _encodeAscii(Encoding at, wchar_t const* end, char const* last) {
     for (; end - at.s >= STEP && at.to <= last; at.s += STEP, at.to += STEP) {
-        __m128i const bytes = _narrow16(at.s);
-        if (!_areAboveZero(bytes)) break;
+        __m128i const bytes = narrow16(at.s);
+        if (!areAscii(bytes)) break;
         store16(at.to, bytes);
     }
     return at;
 }
 
 // Forms of up to four bytes. Each character is spread over as many bytes as the longest form has,
-// with zeros for those that its own form has not; then the zeros are squeezed out.
+// with zeros for those that its own form has not; then the zeros are dropped.
 
-/// The shuffle that moves those of eight bytes that a mask does not drop to the front.
-struct Squeeze {
-    std::array<std::array<std::int8_t, 8>, 256> shuffles{};
-    std::array<std::uint8_t, 256> kept{};
-};
-
-constexpr Squeeze _makeSqueeze() {
-    Squeeze squeeze;
-    for (std::size_t dropped = 0; dropped < 256; ++dropped) {
-        std::size_t kept = 0;
-        for (std::size_t i = 0; i < 8; ++i) {
-            if ((dropped >> i & 1) != 0) continue;
-            squeeze.shuffles[dropped][kept++] = static_cast<std::int8_t>(i);
-        }
-        squeeze.kept[dropped] = static_cast<std::uint8_t>(kept);
-    }
-    return squeeze;
-}
-
-constexpr Squeeze SQUEEZE = _makeSqueeze();
-
-/// Writes the lower eight bytes but for those that the lowest bits of `dropped` tell, and returns
-/// the end of what was written.
-__attribute__((target("ssse3"))) inline char* _squeeze8(__m128i bytes, std::uint32_t dropped,
-                                                        char* to) {
-    dropped &= 0xFF;
-    auto const* const shuffle = reinterpret_cast<__m128i const*>(SQUEEZE.shuffles[dropped].data());
-    _mm_storel_epi64(reinterpret_cast<__m128i*>(to),
-                     _mm_shuffle_epi8(bytes, _mm_loadl_epi64(shuffle)));
-    return to + SQUEEZE.kept[dropped];
+/// Writes those of the lower eight bytes that the lowest bits of `keep` tell, and returns the end
+/// of what was written.
+__attribute__((target("ssse3"))) inline char* _compress8(__m128i bytes, std::uint32_t keep,
+                                                         char* to) {
+    keep &= 0xFF;
+    _mm_storel_epi64(reinterpret_cast<__m128i*>(to), _mm_shuffle_epi8(bytes, placesOf(keep)));
+    return to + COMPRESSION.kept[keep];
 }
 
 /// Writes those of sixteen bytes that are not zero and returns the end of what was written.
-__attribute__((target("ssse3"))) inline char* _squeezeZeros(__m128i bytes, char* to) {
+__attribute__((target("ssse3"))) inline char* _dropZeros(__m128i bytes, char* to) {
     __m128i const zero = _mm_setzero_si128();
-    std::uint32_t const zeros = highBits(_mm_cmpeq_epi8(bytes, zero));
-    to = _squeeze8(bytes, zeros, to);
-    return _squeeze8(_mm_unpackhi_epi64(bytes, zero), zeros >> 8, to);
-}
-
-__m128i _either(__m128i condition, __m128i yes, __m128i no) {
-    return _mm_or_si128(_mm_and_si128(condition, yes), _mm_andnot_si128(condition, no));
+    std::uint32_t const keep = ~highBits(_mm_cmpeq_epi8(bytes, zero));
+    to = _compress8(bytes, keep, to);
+    return _compress8(_mm_unpackhi_epi64(bytes, zero), keep >> 8, to);
 }
 
 /// Spreads the lowest twelve bits of each 16-bit value over its two bytes, the higher six first.
@@ -151,13 +104,13 @@ inline __m128i _splitTwentyFour(__m128i c) {
 /// The forms of eight 16-bit characters below 0x800, in two bytes each.
 inline __m128i _formsOfTwo(__m128i c) {
     __m128i const two = _mm_or_si128(_splitTwelve(c), _mm_set1_epi16(static_cast<short>(0x80C0)));
-    return _either(_mm_cmpgt_epi16(c, _mm_set1_epi16(0x7F)), two, _mm_slli_epi16(c, 8));
+    return either(_mm_cmpgt_epi16(c, _mm_set1_epi16(0x7F)), two, _mm_slli_epi16(c, 8));
 }
 
 /// Writes the forms of eight 16-bit characters from 1 to 0x7FF.
 __attribute__((target("ssse3"))) inline char* _encodeTwos(__m128i c, char* to) {
     if (highBits(_mm_cmpgt_epi16(c, _mm_set1_epi16(0x7F))) != 0)
-        return _squeezeZeros(_formsOfTwo(c), to);
+        return _dropZeros(_formsOfTwo(c), to);
     _mm_storel_epi64(reinterpret_cast<__m128i*>(to), _mm_packus_epi16(c, c));
     return to + STEP / 2;
 }
@@ -172,8 +125,8 @@ inline __m128i _formsOfFour(__m128i c) {
     __m128i const marks = _mm_xor_si128(
         _mm_xor_si128(above(0x7F, 0x80C00000U), above(0x7FF, 0x80C00000U ^ 0x8080E000U)),
         above(0xFFFF, 0x8080E000U ^ 0x808080F0U));
-    return _either(_mm_cmpgt_epi32(c, _mm_set1_epi32(0x7F)),
-                   _mm_or_si128(_splitTwentyFour(c), marks), _mm_slli_epi32(c, 24));
+    return either(_mm_cmpgt_epi32(c, _mm_set1_epi32(0x7F)),
+                  _mm_or_si128(_splitTwentyFour(c), marks), _mm_slli_epi32(c, 24));
 }
 
 /// Writes the forms of four characters of three bytes each, and four bytes beyond.
@@ -192,18 +145,18 @@ __attribute__((target("ssse3"))) inline char* _encodeHalfStep(__m128i a, __m128i
     __m128i const all = _mm_packs_epi32(a, b);
     __m128i const aboveZero = _mm_cmpgt_epi16(all, zero);
     __m128i const aboveTwo = _mm_cmpgt_epi16(all, _mm_set1_epi16(0x7FF));
-    if (_holdsEverywhere(_mm_andnot_si128(aboveTwo, aboveZero))) return _encodeTwos(all, to);
+    if (holdsEverywhere(_mm_andnot_si128(aboveTwo, aboveZero))) return _encodeTwos(all, to);
     __m128i const any = _mm_or_si128(a, b);
     __m128i const belowFour = _mm_cmpeq_epi32(_mm_srli_epi32(any, 16), zero);
-    if (_holdsEverywhere(_mm_and_si128(aboveTwo, belowFour)))
+    if (holdsEverywhere(_mm_and_si128(aboveTwo, belowFour)))
         return _encodeThrees(b, _encodeThrees(a, to));
     __m128i const belowFive = _mm_cmpeq_epi32(_mm_srli_epi32(any, 21), zero);
-    if (!_holdsEverywhere(_mm_and_si128(aboveZero, belowFive))) return nullptr;
-    return _squeezeZeros(_formsOfFour(b), _squeezeZeros(_formsOfFour(a), to));
+    if (!holdsEverywhere(_mm_and_si128(aboveZero, belowFive))) return nullptr;
+    return _dropZeros(_formsOfFour(b), _dropZeros(_formsOfFour(a), to));
 }
 
 /// Encodes half steps of characters from 1 to 0x1FFFFF while `to` is not beyond `last`.
-__attribute__((target("ssse3"))) Progress _encodeMixed(Progress at, wchar_t const* end,
+__attribute__((target("ssse3"))) Encoding _encodeMixed(Encoding at, wchar_t const* end,
                                                        char const* last) {
     for (; end - at.s >= STEP / 2 && at.to <= last; at.s += STEP / 2) {
         char* const to = _encodeHalfStep(load16(at.s), load16(at.s + 4), at.to);
@@ -217,7 +170,7 @@ __attribute__((target("ssse3"))) Progress _encodeMixed(Progress at, wchar_t cons
 
 char* encodeBlock(wchar_t const*& s, wchar_t const* end, char* to, bool shuffle) {
     char const* const last = to + BLOCK - STEP * LONGEST;
-    Progress at = {s, to};
+    Encoding at = {s, to};
     while (at.s != end && at.to <= last) {
         at = _encodeAscii(at, end, last);
         if (shuffle && at.s != end) at = _encodeMixed(at, end, last);
@@ -243,7 +196,7 @@ __m128i _furtherBytesOfStep(wchar_t const* s) {
     __m128i const c = load16(s + 8);
     __m128i const d = load16(s + 12);
     __m128i const any = _mm_or_si128(_mm_or_si128(a, b), _mm_or_si128(c, d));
-    if (!_holdsEverywhere(_mm_cmpeq_epi32(_mm_srli_epi32(any, 16), _mm_setzero_si128()))) {
+    if (!holdsEverywhere(_mm_cmpeq_epi32(_mm_srli_epi32(any, 16), _mm_setzero_si128()))) {
         return _mm_add_epi32(_mm_add_epi32(_furtherBytes(a), _furtherBytes(b)),
                              _mm_add_epi32(_furtherBytes(c), _furtherBytes(d)));
     }
@@ -258,14 +211,8 @@ __m128i _furtherBytesOfStep(wchar_t const* s) {
 
 /// Whether a step holds a NUL. A negative character is narrowed to 0 as well, but is none.
 bool _holdsNul(wchar_t const* s) {
-    bool const may = highBits(_mm_cmpeq_epi8(_narrow16(s), _mm_setzero_si128())) != 0;
+    bool const may = highBits(_mm_cmpeq_epi8(narrow16(s), _mm_setzero_si128())) != 0;
     return may && std::find(s, s + STEP, L'\0') != s + STEP;
-}
-
-std::size_t _sum(__m128i values) {
-    std::array<std::uint32_t, 4> four;
-    store16(four.data(), values);
-    return std::size_t{four[0]} + four[1] + four[2] + four[3];
 }
 
 } // namespace
@@ -275,17 +222,17 @@ std::size_t _sum(__m128i values) {
     wchar_t const* const start = s;
     wchar_t const* const end = s + size;
     // Most texts are ASCII, which alone takes half as long as in the loop below.
-    while (end - s >= STEP && _areAboveZero(_narrow16(s))) s += STEP;
+    while (end - s >= STEP && areAscii(narrow16(s))) s += STEP;
     __m128i further = _mm_setzero_si128();
     for (; end - s >= STEP; s += STEP) {
-        if (_areAboveZero(_narrow16(s))) continue;
+        if (areAscii(narrow16(s))) continue;
         if (_holdsNul(s)) break;
         further = _mm_sub_epi32(further, _furtherBytesOfStep(s));
     }
     for (; s != end && *s != 0; ++s) {
         further = _mm_sub_epi32(further, _furtherBytes(_mm_cvtsi32_si128(*s)));
     }
-    return static_cast<std::size_t>(s - start) + _sum(further);
+    return static_cast<std::size_t>(s - start) + sum4(further);
 }
 
 } // namespace Koru

@@ -11,30 +11,8 @@ namespace Koru {
 
 namespace {
 
-/// Looks at 64 numbers a step. `equal` tells which of eight numbers are looked for, `matches`
-/// whether one is.
-template <class Equal, class Matches>
-std::size_t _find(std::vector<Fingerprint> const& column, std::size_t from, Equal equal,
-                  Matches matches) {
-    Fingerprint const* const numbers = column.data();
-    std::size_t const size = column.size();
-    auto const in8 = [numbers, equal](std::size_t at) { return equal(load16(numbers + at)); };
-    auto const in16 = [in8](std::size_t at) { return _mm_or_si128(in8(at), in8(at + 8)); };
-    auto const in32 = [in16](std::size_t at) { return _mm_or_si128(in16(at), in16(at + 16)); };
-    std::size_t i = from;
-    for (; size - i >= 64; i += 64) {
-        if (highBits(_mm_or_si128(in32(i), in32(i + 32))) != 0) break;
-    }
-    for (; size - i >= 8; i += 8) {
-        std::uint32_t const found = highBits(in8(i));
-        if (found != 0) return i + static_cast<std::size_t>(__builtin_ctz(found)) / sizeof *numbers;
-    }
-    auto const* const found = std::find_if(numbers + i, numbers + size, matches);
-    return found == numbers + size ? NOT_FOUND : static_cast<std::size_t>(found - numbers);
-}
-
 /// Passes over steps of 64 numbers that are all others, with vectors twice as wide, and returns how
-/// far it came. `_find` does the rest.
+/// far it came.
 __attribute__((target("avx2"))) std::size_t _pass(Fingerprint const* numbers, std::size_t size,
                                                   Fingerprint wanted, std::size_t from) {
     __m256i const pattern = _mm256_set1_epi16(static_cast<short>(wanted));
@@ -54,29 +32,42 @@ __attribute__((target("avx2"))) std::size_t _pass(Fingerprint const* numbers, st
     return i;
 }
 
-__m128i _eightOf(Fingerprint number) { return _mm_set1_epi16(static_cast<short>(number)); }
+/// The position of the first of two numbers. Inlined by force: where they are the same, half of the
+/// comparisons fall away.
+[[gnu::always_inline]] inline std::size_t _find(std::vector<Fingerprint> const& column,
+                                                Fingerprint wanted, Fingerprint orThis,
+                                                std::size_t from) {
+    Fingerprint const* const numbers = column.data();
+    std::size_t const size = column.size();
+    __m128i const a = _mm_set1_epi16(static_cast<short>(wanted));
+    __m128i const b = _mm_set1_epi16(static_cast<short>(orThis));
+    auto const in8 = [numbers, a, b](std::size_t at) {
+        __m128i const eight = load16(numbers + at);
+        return _mm_or_si128(_mm_cmpeq_epi16(eight, a), _mm_cmpeq_epi16(eight, b));
+    };
+    auto const in16 = [in8](std::size_t at) { return _mm_or_si128(in8(at), in8(at + 8)); };
+    auto const in32 = [in16](std::size_t at) { return _mm_or_si128(in16(at), in16(at + 16)); };
+    std::size_t i = from;
+    while (size - i >= 64 && highBits(_mm_or_si128(in32(i), in32(i + 32))) == 0) i += 64;
+    for (; size - i >= 8; i += 8) {
+        std::uint32_t const found = highBits(in8(i));
+        if (found != 0) return i + static_cast<std::size_t>(__builtin_ctz(found)) / sizeof *numbers;
+    }
+    while (i != size && numbers[i] != wanted && numbers[i] != orThis) ++i;
+    return i == size ? NOT_FOUND : i;
+}
 
 } // namespace
 
 std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint wanted,
                             std::size_t from) {
-    __m128i const pattern = _eightOf(wanted);
     if (__builtin_cpu_supports("avx2")) from = _pass(column.data(), column.size(), wanted, from);
-    return _find(
-        column, from, [pattern](__m128i numbers) { return _mm_cmpeq_epi16(numbers, pattern); },
-        [wanted](Fingerprint number) { return number == wanted; });
+    return _find(column, wanted, wanted, from);
 }
 
 std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint wanted,
                             Fingerprint orThis, std::size_t from) {
-    __m128i const a = _eightOf(wanted);
-    __m128i const b = _eightOf(orThis);
-    return _find(
-        column, from,
-        [a, b](__m128i numbers) {
-            return _mm_or_si128(_mm_cmpeq_epi16(numbers, a), _mm_cmpeq_epi16(numbers, b));
-        },
-        [wanted, orThis](Fingerprint number) { return number == wanted || number == orThis; });
+    return _find(column, wanted, orThis, from);
 }
 
 namespace {
@@ -153,36 +144,21 @@ private:
     __m128i sum_ = _mm_setzero_si128();
 };
 
-/// The characters of a name before its first NUL as characters of ASCII that count as the same.
-class AsciiClasses {
-public:
-    AsciiClasses(char const* name, std::size_t size) {
-        for (std::size_t i = 0; i != size && size_ != MOST; ++i) {
-            bool const continues = (name[i] & 0xC0) == 0x80;
-            if (!continues) add(static_cast<std::uint32_t>(name[i]));
-        }
-    }
+bool _continues(char c) { return (c & 0xC0) == 0x80; }
+bool _continues(wchar_t) { return false; }
 
-    AsciiClasses(wchar_t const* name, std::size_t size) {
-        for (std::size_t i = 0; i != size && size_ != MOST && name[i] != 0; ++i) {
-            add(static_cast<std::uint32_t>(name[i]));
-        }
-    }
-
-    Sum sum() const { return Sum(classes_.data(), size_); }
-
-private:
-    void add(std::uint32_t c) { classes_[size_++] = static_cast<char>(classOf(c)); }
-
-    std::array<char, MOST> classes_; // uninitialised from size_ on
-    std::size_t size_ = 0;
-};
-
-/// Apart, so that others do without the memory that it takes.
+/// The number of a name that is not all ASCII or holds a NUL. Apart, so that others do without the
+/// memory that it takes.
 template <class Char>
-__attribute__((noinline)) std::uint32_t _mixClasses(std::uint32_t before, Char const* name,
-                                                    std::size_t size) {
-    return AsciiClasses(name, size).sum().mixedInto(before);
+[[gnu::noinline]] std::uint32_t _mixClasses(std::uint32_t before, Char const* name,
+                                            std::size_t size) {
+    std::array<char, MOST> classes;
+    std::size_t count = 0;
+    for (std::size_t i = 0; i != size && count != MOST && name[i] != 0; ++i) {
+        if (_continues(name[i])) continue;
+        classes[count++] = static_cast<char>(classOf(static_cast<std::uint32_t>(name[i])));
+    }
+    return Sum(classes.data(), count).mixedInto(before);
 }
 
 template <class Char>

@@ -55,7 +55,7 @@ template <class Char>
 
 /// Whether all bytes of a register are characters of ASCII, and not NUL.
 inline bool areAscii(__m128i bytes) {
-    return highBits(_mm_cmpgt_epi8(bytes, _mm_setzero_si128())) == ALL_BYTES;
+    return holdsEverywhere(_mm_cmpgt_epi8(bytes, _mm_setzero_si128()));
 }
 
 /// Whether a text is ASCII without a NUL.
@@ -68,10 +68,14 @@ bool isAscii(Char const* s, std::size_t size) {
     return areAscii(narrow16(s + size - 16)); // overlaps what was looked at already
 }
 
-/// Writes such a text as bytes and returns their end.
+/// Writes the low 8 bits of each character, which are all of it in such a text, and returns the end
+/// of what was written.
 inline char* narrow(wchar_t const* s, std::size_t size, char* to) {
+    __m128i const byte = _mm_set1_epi32(0xFF);
+    auto const four = [s, byte](std::size_t i) { return _mm_and_si128(load16(s + i), byte); };
+    auto const eight = [four](std::size_t i) { return _mm_packs_epi32(four(i), four(i + 4)); };
     std::size_t i = 0;
-    for (; size - i >= 16; i += 16) store16(to + i, narrow16(s + i));
+    for (; size - i >= 16; i += 16) store16(to + i, _mm_packus_epi16(eight(i), eight(i + 8)));
     for (; i != size; ++i) to[i] = static_cast<char>(s[i]);
     return to + size;
 }

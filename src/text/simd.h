@@ -4,6 +4,8 @@
 
 #include <emmintrin.h>
 
+#include <array>
+#include <cstddef>
 #include <cstdint>
 
 namespace Koru {
@@ -20,6 +22,21 @@ inline std::uint32_t highBits(__m128i bytes) {
 }
 
 constexpr std::uint32_t ALL_BYTES = 0xFFFF;
+
+/// Whether all bits of a comparison's result are set.
+inline bool holdsEverywhere(__m128i condition) { return highBits(condition) == ALL_BYTES; }
+
+/// The bits of `yes` where those of the condition are set, and elsewhere those of `no`.
+inline __m128i either(__m128i condition, __m128i yes, __m128i no) {
+    return _mm_or_si128(_mm_and_si128(condition, yes), _mm_andnot_si128(condition, no));
+}
+
+/// The sum of four 32-bit values.
+inline std::size_t sum4(__m128i values) {
+    std::array<std::uint32_t, 4> four;
+    store16(four.data(), values);
+    return std::size_t{four[0]} + four[1] + four[2] + four[3];
+}
 
 } // namespace Koru
 

@@ -13,7 +13,7 @@
 #include "text/convert.h"
 #include "text/fold.h"
 #include "text/insert.h"
-#include "text/simd.h"
+#include "text/narrow.h"
 #include "text/utf8.h"
 
 namespace Koru {
@@ -102,37 +102,27 @@ int compare(std::wstring const& a, std::wstring const& b) {
     return _compareCases(x + i, y + i, size - i);
 }
 
-// What is too long for any string is want of memory too: callers have one failure to know.
-std::string make_string(char const* s) try {
-    return length(s) == 0 ? _null_string : std::string(s);
-} catch (std::length_error const&) {
-    throw std::bad_alloc();
-}
-
-std::wstring make_wstring(wchar_t const* s) try {
-    return length(s) == 0 ? _null_wstring : std::wstring(s);
-} catch (std::length_error const&) {
-    throw std::bad_alloc();
-}
-
-std::string make_string(wchar_t const* s) { return make_string(make_wstring(s)); }
-
-namespace {
-
-std::wstring _fillAndCopy(wchar_t const* s, std::size_t size) {
+std::wstring wideString(wchar_t const* s, std::size_t size) {
+    constexpr std::size_t worthwhile = 128; // Beyond it, to fill the string first takes longer.
+    if (size > worthwhile) return std::wstring(s, size);
     std::wstring result(size, L'\0');
     std::copy(s, s + size, result.begin());
     return result;
 }
 
-} // namespace
-
-std::wstring wideString(wchar_t const* s, std::size_t size) {
-    constexpr std::size_t worthwhile = 128; // Beyond it, to fill the string first takes longer.
-    return size <= worthwhile ? _fillAndCopy(s, size) : std::wstring(s, size);
-}
-
 namespace {
+
+std::string _toString(char const* s, std::size_t size) { return std::string(s, size); }
+std::wstring _toString(wchar_t const* s, std::size_t size) { return wideString(s, size); }
+
+// What is too long for any string is want of memory too: callers have one failure to know.
+
+template <class Char>
+std::basic_string<Char> _copy(Char const* s, std::basic_string<Char> const& nothing) try {
+    return length(s) == 0 ? nothing : std::basic_string<Char>(s);
+} catch (std::length_error const&) {
+    throw std::bad_alloc();
+}
 
 /// Whether a text is ASCII without a NUL and no longer than most names. For that a block is not
 /// worth its while.
@@ -141,89 +131,67 @@ bool _isPlainName(Char const* s, Char const* end) {
     return end - s < 16 && std::all_of(s, end, [](Char c) { return c > 0 && c <= 0x7F; });
 }
 
-/// Decodes text without zero bytes.
-std::wstring _decode(char const* s, char const* end) try {
-    if (s == end) return _null_wstring;
-    if (_isPlainName(s, end)) return std::wstring(s, end);
+/// Converts a text. `convertBlock` is decodeBlock or encodeBlock; `bound` tells how many units are
+/// to be reserved. Inlined by force: short texts would pay for a further call.
+template <class In, class Out, class ConvertBlock, class Bound>
+[[gnu::always_inline]] inline std::basic_string<Out>
+_convert(In const* s, In const* end, std::basic_string<Out> const& nothing,
+         ConvertBlock convertBlock, Bound bound) try {
+    if (s == end) return nothing;
+    if (_isPlainName(s, end)) return std::basic_string<Out>(s, end);
     bool const shuffle = canShuffle();
-    alignas(BLOCK_ALIGNMENT) wchar_t block[BLOCK];
-    wchar_t* filled = decodeBlock(s, end, block, shuffle);
-    if (s == end) return wideString(block, static_cast<std::size_t>(filled - block));
-    std::wstring result;
-    result.reserve(static_cast<std::size_t>(filled - block) +
-                   countLeads(s, static_cast<std::size_t>(end - s)));
-    for (result.append(block, filled); s != end; result.append(block, filled)) {
-        filled = decodeBlock(s, end, block, shuffle);
-    }
+    alignas(BLOCK_ALIGNMENT) Out block[BLOCK];
+    auto const fill = [&] {
+        return static_cast<std::size_t>(convertBlock(s, end, block, shuffle) - block);
+    };
+    std::size_t filled = fill();
+    if (s == end) return _toString(block, filled);
+    std::basic_string<Out> result;
+    result.reserve(filled + bound(s, static_cast<std::size_t>(end - s)));
+    for (result.append(block, filled); s != end; result.append(block, filled)) filled = fill();
     return result;
 } catch (std::length_error const&) {
     throw std::bad_alloc();
+}
+
+std::wstring _decode(char const* s, std::size_t size) {
+    return _convert(s, s + size, _null_wstring, decodeBlock, countLeads);
 }
 
 } // namespace
 
-std::wstring make_wstring(char const* s) { return _decode(s, s + length(s)); }
+std::string make_string(char const* s) { return _copy(s, _null_string); }
 
-std::wstring make_wstring(std::string const& s) {
-    return _decode(s.data(), s.data() + ::strnlen(s.data(), s.size()));
+std::wstring make_wstring(wchar_t const* s) { return _copy(s, _null_wstring); }
+
+std::string make_string(wchar_t const* s) { return make_string(make_wstring(s)); }
+
+std::string make_string(std::wstring const& s) {
+    return _convert(s.data(), s.data() + s.size(), _null_string, encodeBlock, encodedBound);
 }
+
+std::wstring make_wstring(char const* s) { return _decode(s, length(s)); }
+
+std::wstring make_wstring(std::string const& s) { return _decode(s.data(), length(s)); }
 
 std::wstring make_wstring(char const* s, std::size_t size) {
-    return _decode(s, s + ::strnlen(s, size));
-}
-
-std::string make_string(std::wstring const& text) try {
-    wchar_t const* s = text.data();
-    wchar_t const* const end = s + text.size();
-    if (s == end) return _null_string;
-    if (_isPlainName(s, end)) return std::string(s, end);
-    bool const shuffle = canShuffle();
-    alignas(BLOCK_ALIGNMENT) char block[BLOCK];
-    char* filled = encodeBlock(s, end, block, shuffle);
-    if (s == end) return std::string(block, filled);
-    std::string result;
-    result.reserve(static_cast<std::size_t>(filled - block) +
-                   encodedBound(s, static_cast<std::size_t>(end - s)));
-    for (result.append(block, filled); s != end; result.append(block, filled)) {
-        filled = encodeBlock(s, end, block, shuffle);
-    }
-    return result;
-} catch (std::length_error const&) {
-    throw std::bad_alloc();
+    return _decode(s, ::strnlen(s, size));
 }
 
 char* encode(wchar_t const* s, std::size_t size, char* to) {
     bool const shuffle = canShuffle();
     alignas(BLOCK_ALIGNMENT) char block[BLOCK];
     for (wchar_t const* const end = s + size; s != end;) {
-        auto const bytes = static_cast<std::size_t>(encodeBlock(s, end, block, shuffle) - block);
-        std::memcpy(to, block, bytes);
-        to += bytes;
+        to = std::copy(block, encodeBlock(s, end, block, shuffle), to);
     }
     return to;
 }
-
-namespace {
-
-/// Writes the low 8 bits of each character to `to`.
-void _lowBytes(wchar_t const* s, std::size_t size, char* to) {
-    __m128i const byte = _mm_set1_epi32(0xFF);
-    auto const four = [s, byte](std::size_t i) { return _mm_and_si128(load16(s + i), byte); };
-    std::size_t i = 0;
-    for (; size - i >= 16; i += 16) {
-        store16(to + i, _mm_packus_epi16(_mm_packs_epi32(four(i), four(i + 4)),
-                                         _mm_packs_epi32(four(i + 8), four(i + 12))));
-    }
-    for (; i != size; ++i) to[i] = static_cast<char>(s[i]);
-}
-
-} // namespace
 
 std::ostream& operator<<(std::ostream& os, std::wstring const& s) {
     char block[BLOCK];
     for (std::size_t done = 0; done != s.size();) {
         std::size_t const size = std::min(s.size() - done, BLOCK);
-        _lowBytes(s.data() + done, size, block);
+        narrow(s.data() + done, size, block);
         insert(os, block, size);
         done += size;
     }

@@ -20,6 +20,14 @@ constexpr std::size_t BLOCK_ALIGNMENT = 16;
 /// How many bytes or characters a step takes in at the most.
 constexpr std::ptrdiff_t STEP = 16;
 
+/// How far a conversion has come. Taken and returned by value, which keeps it in registers: any
+/// byte that is written through a reference to it might change it, as far as the compiler knows.
+template <class In, class Out>
+struct Progress {
+    In const* s;
+    Out* to;
+};
+
 /// Whether this machine can rearrange the bytes of a register at will.
 inline bool canShuffle() { return __builtin_cpu_supports("ssse3"); }
 
