@@ -11,11 +11,10 @@
 #include <vector>
 
 #include "check.h"
-#include "scratchfile.h"
+#include "memoryfile.h"
 
 namespace {
 
-using fuzz::scratchFile;
 using Koru::DataFile;
 using Koru::File;
 using Bytes = std::vector<unsigned char>;
@@ -106,24 +105,25 @@ bool opens(DataFile& file) {
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size) {
-    scratchFile().write(data, size);
+    static fuzz::MemoryFile const memory;
+    memory.write(data, size);
     std::string rest(data, data + size);
     Entries const expected = completeEntries(rest);
 
-    DataFile file{File::Path(scratchFile().name())};
+    DataFile file(memory.path());
     KORU_CHECK(opens(file) == rest.empty());
     KORU_CHECK(file.is_open());
     KORU_CHECK(sorted(held(file)) == sorted(expected));
     for (int rewrite = 0; rewrite < 2; ++rewrite) {
         std::string const bytes = bytesOf(held(file));
         file.close();
-        KORU_CHECK(scratchFile().bytes() == bytes);
+        KORU_CHECK(memory.bytes() == bytes);
         KORU_CHECK(opens(file));
         KORU_CHECK(sorted(held(file)) == sorted(expected));
     }
     for (auto const& entry : expected) file.remove(DataFile::Record(entry.first, entry.second));
     KORU_CHECK(file.size() == 0);
     file.close();
-    KORU_CHECK(scratchFile().bytes().empty());
+    KORU_CHECK(memory.bytes().empty());
     return 0;
 }

@@ -6,11 +6,10 @@
 #include <vector>
 
 #include "check.h"
-#include "scratchfile.h"
+#include "memoryfile.h"
 
 namespace {
 
-using fuzz::scratchFile;
 using Koru::File;
 using Koru::InitializationFile;
 
@@ -29,8 +28,9 @@ std::vector<std::wstring> contentOf(InitializationFile& file) {
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size) {
-    scratchFile().write(data, size);
-    InitializationFile file{File::Path(scratchFile().name())};
+    static fuzz::MemoryFile const memory;
+    memory.write(data, size);
+    InitializationFile file(memory.path());
     file.open(File::READ | File::WRITE);
     // The first rewrite may change the table: an overlong blank or line feed becomes a plain one.
     file.synchronize();

@@ -8,8 +8,10 @@
 #include <string>
 
 extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size);
+extern "C" [[gnu::weak]] int LLVMFuzzerInitialize(int* argc, char*** argv);
 
 int main(int argc, char** argv) {
+    if (LLVMFuzzerInitialize != nullptr) LLVMFuzzerInitialize(&argc, &argv);
     int count = 0;
     for (int i = 1; i < argc; ++i) {
         for (auto const& entry : std::filesystem::recursive_directory_iterator(argv[i])) {
@@ -21,6 +23,7 @@ int main(int argc, char** argv) {
             ++count;
         }
     }
-    std::printf("%d inputs replayed\n", count);
+    // A target may have turned the standard output off.
+    std::fprintf(stderr, "%d inputs replayed\n", count);
     return count == 0 ? 1 : 0;
 }

@@ -7,11 +7,10 @@
 #include <vector>
 
 #include "check.h"
-#include "scratchfile.h"
+#include "memoryfile.h"
 
 namespace {
 
-using fuzz::scratchFile;
 using Koru::File;
 using Koru::PropertyFile;
 
@@ -30,8 +29,9 @@ std::string drain(PropertyFile& file) {
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size) {
-    scratchFile().write(data, size);
-    PropertyFile file{File::Path(scratchFile().name())};
+    static fuzz::MemoryFile const memory;
+    memory.write(data, size);
+    PropertyFile file(memory.path());
     file.open(File::READ);
     std::string const text = drain(file);
     file.close();
@@ -39,13 +39,13 @@ extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size
     file.open(File::READ | File::WRITE);
     // The first rewrite may change the list: an overlong blank or line feed becomes a plain one.
     file.synchronize();
-    KORU_CHECK(scratchFile().bytes() == text);
+    KORU_CHECK(memory.bytes() == text);
     file.synchronize();
-    std::string const once = scratchFile().bytes();
+    std::string const once = memory.bytes();
     file.synchronize();
-    KORU_CHECK(scratchFile().bytes() == once);
+    KORU_CHECK(memory.bytes() == once);
     KORU_CHECK(drain(file) == once);
     file.close();
-    KORU_CHECK(scratchFile().bytes().empty());
+    KORU_CHECK(memory.bytes().empty());
     return 0;
 }
