@@ -4,7 +4,6 @@
 #include <koru/string.h>
 
 #include <dlfcn.h>
-#include <stdlib.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -25,6 +24,7 @@
 namespace {
 
 using Names = std::vector<std::string>;
+using Numbers = std::vector<int>;
 using Koru::DynamicLibrary;
 
 std::wstring const FIRST = Koru::make_wstring(KORU_TEST_LOADABLE_1);
@@ -38,34 +38,28 @@ class Loader {
 public:
     explicit Loader(char const* expectedCalls = nullptr) : expectedCalls_(expectedCalls) {
         current = this;
-        ::setenv("KORU_LOADABLE_REPORT", (directory_ / "report").c_str(), 1);
     }
+    Loader(Loader const&) = delete;
+    Loader& operator=(Loader const&) = delete;
     ~Loader() {
-        ::unsetenv("KORU_LOADABLE_REPORT");
         current = nullptr;
         if (expectedCalls_ != nullptr) CHECK(calls == expectedCalls_);
         CHECK(std::is_permutation(handles.begin(), handles.end(), closed.begin(), closed.end()));
-    }
-
-    /// What the libraries report: "+1" when the first is mapped, "-1" when it is unmapped.
-    std::string report() const {
-        std::string const path = directory_ / "report";
-        return std::filesystem::exists(path) ? test::readFile(path) : "";
     }
 
     bool refusesToOpen = false;
     bool failsToClose = false;
     std::string calls; ///< "o" for a successful open, "x" for a failed one, "c" for a close
     Names opened;
-    std::vector<int> flags;
+    Numbers flags;
     std::vector<void*> handles; ///< that were given out
     std::vector<void*> closed;
+    Numbers report; ///< of the libraries: 1 when the first is loaded, -1 when it is unloaded
 
     inline static Loader* current = nullptr;
 
 private:
     char const* expectedCalls_;
-    test::TempDir directory_;
 };
 
 template <class Function>
@@ -74,6 +68,11 @@ Function* real(char const* name) {
 }
 
 } // namespace
+
+extern "C" __attribute__((visibility("default"))) void koru_loadable_report(int number);
+extern "C" void koru_loadable_report(int number) {
+    if (Loader::current != nullptr) Loader::current->report.push_back(number);
+}
 
 extern "C" void* dlopen(char const* name, int flags) noexcept {
     static auto* const open = real<void*(char const*, int)>("dlopen");
@@ -197,7 +196,7 @@ TEST_CASE("load binds functions lazily and keeps the library's symbols to itself
     CHECK(library.load());
     checkLoaded(library, FIRST);
     CHECK(loader.opened == Names{KORU_TEST_LOADABLE_1});
-    CHECK(loader.flags == std::vector<int>{1});
+    CHECK(loader.flags == Numbers{1});
     CHECK(RTLD_LAZY == 1);
     CHECK(loader.handles == std::vector<void*>{library.getHandle()});
     CHECK(::dlsym(RTLD_DEFAULT, "koru_loadable_number") == nullptr);
@@ -210,7 +209,7 @@ TEST_CASE("the second load of a loaded library returns true and does not open it
     CHECK(library.load());
     CHECK(loader.handles == std::vector<void*>{library.getHandle()});
     CHECK(library.unload());
-    CHECK(loader.report() == "+1-1");
+    CHECK(loader.report == Numbers{1, -1});
 }
 
 TEST_CASE("unload gives the handle back and returns true") {
@@ -247,7 +246,7 @@ TEST_CASE("the destructor gives back what is loaded, and only that") {
     DynamicLibrary failed(MISSING);
     CHECK(unloaded.unload());
     CHECK(!failed.load());
-    CHECK(loader.report() == "+1+2-2");
+    CHECK(loader.report == Numbers{1, 2, -2});
 }
 
 TEST_CASE("a library may be loaded and unloaded any number of times by one object") {
@@ -258,7 +257,7 @@ TEST_CASE("a library may be loaded and unloaded any number of times by one objec
         CHECK(numberOf(library) == 1);
         CHECK(library.unload());
     }
-    CHECK(loader.report() == "+1-1+1-1+1-1");
+    CHECK(loader.report == Numbers{1, -1, 1, -1, 1, -1});
 }
 
 TEST_CASE("a failed load leaves nothing loaded and may be repeated until the file is there") {
@@ -374,9 +373,9 @@ TEST_CASE("two objects with the same name hold a handle each") {
     Loaded two(FIRST);
     CHECK(one.unload());
     CHECK(numberOf(two) == 1);
-    CHECK(loader.report() == "+1");
+    CHECK(loader.report == Numbers{1});
     CHECK(two.unload());
-    CHECK(loader.report() == "+1-1");
+    CHECK(loader.report == Numbers{1, -1});
 }
 
 TEST_CASE("symbols of functions and data are found in the object's own library") {
@@ -440,13 +439,13 @@ TEST_CASE("a copy of a loaded library has a handle of its own and survives the o
     {
         DynamicLibrary const copy(*original);
         CHECK(loader.opened == Names{KORU_TEST_LOADABLE_1, KORU_TEST_LOADABLE_1});
-        CHECK(loader.flags == std::vector<int>{1, 1});
+        CHECK(loader.flags == Numbers{1, 1});
         checkLoaded(copy, FIRST);
         original.reset();
         checkLoaded(copy, FIRST);
-        CHECK(loader.report() == "+1");
+        CHECK(loader.report == Numbers{1});
     }
-    CHECK(loader.report() == "+1-1");
+    CHECK(loader.report == Numbers{1, -1});
 }
 
 TEST_CASE("the original survives its copy") {
@@ -508,9 +507,9 @@ TEST_CASE("libraries stay loaded when the vector that holds them grows, and none
             CHECK(numberOf(libraries[i]) == (i % 2 == 0 ? 1 : 2));
         libraries.erase(libraries.begin(), libraries.begin() + 19);
         CHECK(numberOf(libraries[0]) == 2);
-        CHECK(loader.report() == "+1+2-1");
+        CHECK(loader.report == Numbers{1, 2, -1});
     }
-    CHECK(loader.report() == "+1+2-1-2");
+    CHECK(loader.report == Numbers{1, 2, -1, -2});
 }
 
 namespace {
@@ -540,7 +539,7 @@ TEST_CASE("assigning unloads what was loaded, takes the name and loads what the 
         if (targetLoaded) CHECK(target.load());
         bool const sourceLoaded = source.isLoaded();
         CHECK(&(target = source) == &target);
-        CHECK(loader.report() == (targetLoaded ? "+1-1" : ""));
+        CHECK(loader.report == (targetLoaded ? Numbers{1, -1} : Numbers{}));
         CHECK(source.isLoaded() == sourceLoaded);
         (sourceLoaded ? checkLoaded : checkUnloaded)(target, SECOND);
     });

@@ -1,28 +1,14 @@
-// A library for the loader's tests, built once for each KORU_LOADABLE_NUMBER. It reports its life
-// in the file that the environment names: "+1" when it is loaded, "-1" when it is unloaded.
-#include <fcntl.h>
-#include <stdlib.h>
-#include <unistd.h>
-
+// A library for the loader's tests, built once for each KORU_LOADABLE_NUMBER. It reports its life to
+// the program that loads it, if that wants to know: 1 when it is loaded, -1 when it is unloaded.
 namespace {
 
 int const NUMBER = KORU_LOADABLE_NUMBER;
 
-void report(char event) {
-    char const* const path = ::getenv("KORU_LOADABLE_REPORT");
-    if (path == nullptr) return;
-    int const fd = ::open(path, O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0600);
-    char const text[2] = {event, static_cast<char>('0' + NUMBER)};
-    if (::write(fd, text, sizeof text) != 2) ::abort();
-    ::close(fd);
-}
-
-__attribute__((constructor)) void loaded() { report('+'); }
-__attribute__((destructor)) void unloaded() { report('-'); }
-
 } // namespace
 
 extern "C" {
+
+__attribute__((weak)) void koru_loadable_report(int number);
 
 extern __attribute__((visibility("default"))) int koru_loadable_data;
 int koru_loadable_data = NUMBER * 100;
@@ -34,3 +20,14 @@ int koru_loadable_number() { return NUMBER; }
 __attribute__((visibility("default"))) int koru_loadable_size() __asm__("gr\303\266\303\237e");
 int koru_loadable_size() { return NUMBER * 1000; }
 }
+
+namespace {
+
+void report(int number) {
+    if (koru_loadable_report != nullptr) koru_loadable_report(number);
+}
+
+__attribute__((constructor)) void loaded() { report(NUMBER); }
+__attribute__((destructor)) void unloaded() { report(-NUMBER); }
+
+} // namespace
