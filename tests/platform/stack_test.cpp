@@ -120,9 +120,8 @@ TEST_CASE("files of every kind are read and written from any stack") {
         Koru::PropertyFile properties(directory / "properties");
         Koru::DataFile records(directory / "records");
         Koru::LogFile log(directory / "log");
-        settings.open(File::READ | File::WRITE);
-        properties.open(File::READ | File::WRITE);
-        records.open(File::READ | File::WRITE);
+        File* const files[] = {&settings, &properties, &records};
+        for (File* const file : files) file->open(File::READ | File::WRITE);
         log.open(3U);
         for (std::wstring const& text : texts()) {
             settings.setValue(text, text, text);
@@ -132,17 +131,13 @@ TEST_CASE("files of every kind are read and written from any stack") {
         }
         bool const held = settings.getValue(L"aX", L"ax") == L"ax" &&
                           properties.getValue(L"AX") == L"ax" && records.size() > 20;
-        settings.synchronize();
-        properties.synchronize();
-        records.synchronize();
+        for (File* const file : files) file->synchronize();
         settings.removeSection(L"ax");
         properties.removeKey(L"ax");
         records.remove({L"kax", {}});
         bool const enumerated =
             settings.enumerateSections().size() > 20 && properties.enumerateKeys().size() > 20;
-        settings.close();
-        properties.close();
-        records.close();
+        for (File* const file : files) file->close();
         log.close();
         return held && enumerated;
     }));

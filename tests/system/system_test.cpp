@@ -391,8 +391,13 @@ TEST_CASE("deleteFile does what File::remove does, whatever is in its way") {
     checkAlike(onFirst<System::deleteFile>, onFirst<File::remove>, false);
 }
 
-TEST_CASE("copyFile does what File::copy does, whatever is in its way") {
+TEST_CASE("copyFile leaves the text of a pointer, null when there was nothing to copy") {
     checkAlike(System::copyFile, File::copy, true);
+    Filled const directory;
+    CHECK(System::copyFile(directory.wide("full"), directory.wide("copy")));
+    CHECK(contentOf(directory / "copy") == "<address>");
+    CHECK(!System::copyFile(directory.wide("missing"), directory.wide("null")));
+    CHECK(test::readFile(directory / "null") == "0");
 }
 
 TEST_CASE("createFile does what File::create does, whatever is in its way") {
