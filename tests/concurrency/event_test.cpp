@@ -13,7 +13,6 @@
 
 #include <atomic>
 #include <chrono>
-#include <fstream>
 #include <functional>
 #include <limits>
 #include <memory>
@@ -25,6 +24,7 @@
 
 #include "support/cancellation.h"
 #include "support/script.h"
+#include "support/sleeping.h"
 #include "support/subprocess.h"
 
 namespace {
@@ -83,15 +83,6 @@ struct Answered : TimedWait {
     int result = 99;
 };
 
-/// True if the thread sleeps in the kernel.
-bool sleeps(long threadId) {
-    std::ifstream in("/proc/self/task/" + std::to_string(threadId) + "/stat");
-    std::string line;
-    std::getline(in, line);
-    std::size_t const state = line.rfind(") ");
-    return state != std::string::npos && line[state + 2] == 'S';
-}
-
 /// A thread that waits for an event. It has gone to sleep there when it has been made.
 class Waiter {
 public:
@@ -114,15 +105,11 @@ private:
     template <class Wait>
     explicit Waiter(Wait wait)
         : thread_([this, wait] {
-              threadId_ = ::syscall(SYS_gettid);
+              threadId_ = test::ownThreadId();
               result_ = wait();
               returned_ = true;
           }) {
-        while (threadId_ == 0) ::usleep(1000);
-        for (int inARow = 0; inARow < 20 && !returned_;) {
-            inARow = sleeps(threadId_) ? inARow + 1 : 0;
-            ::usleep(2000);
-        }
+        test::untilSleeping(threadId_, [this] { return returned(); });
     }
 
     std::atomic<long> threadId_{0};
@@ -163,6 +150,43 @@ void follow(std::string const& script) {
     test::follow(event, WORDS, script);
 }
 
+struct Signal {
+    static void run(Event& event) { event.signal(); }
+};
+struct Reset {
+    static void run(Event& event) { event.reset(); }
+};
+struct Test {
+    static void run(Event& event) { event.test(); }
+};
+struct Wait {
+    static void run(Event& event) { event.wait(0); }
+};
+
+/// 0 when a thread that is cancelled in its wait is unwound and leaves the event usable.
+int cancelledInWait(unsigned long timeout, bool cancelsItself) {
+    Event event(true);
+    std::atomic<long> threadId{0};
+    std::atomic<bool> returned{false};
+    bool const cancelled = test::endsCancelled(
+        [&] {
+            if (cancelsItself) ::pthread_cancel(::pthread_self());
+            threadId = test::ownThreadId();
+            event.wait(timeout);
+            returned = true;
+        },
+        [&](pthread_t thread) {
+            if (cancelsItself) return;
+            test::untilSleeping(threadId, [&] { return returned.load(); });
+            ::pthread_cancel(thread);
+        });
+    if (!cancelled || returned) return 1;
+    if (!usable(event)) return 2;
+    bool elsewhere = false;
+    std::thread([&] { elsewhere = usable(event); }).join();
+    return elsewhere ? 0 : 3;
+}
+
 } // namespace
 
 TEST_CASE("an event is made from a choice, cannot be copied and has a virtual destructor") {
@@ -195,8 +219,6 @@ TEST_CASE("a derived object is destroyed through a pointer to its event") {
     event.reset();
     CHECK(destroyed);
 }
-
-// ---- The flag
 
 TEST_CASE_TEMPLATE("a new event is not signalled", Reset, AutoReset, ManualReset) {
     follow<Reset>("lowered lowered");
@@ -250,8 +272,6 @@ TEST_CASE("each signal of an auto-reset event is seen by exactly one of the test
     for (std::thread& thread : threads) thread.join();
     CHECK(seen == SIGNALS);
 }
-
-// ---- Waiting
 
 TEST_CASE("a wait of 0 seconds returns 1 when nobody signals") {
     Event event(true);
@@ -369,8 +389,6 @@ TEST_CASE("the loop that tests before it waits misses no signal") {
     CHECK_FALSE(event.test());
 }
 
-// ---- The timed wait of the C library
-
 TEST_CASE("the deadline is the present time in microseconds and the seconds of the time-out") {
     Event event(true);
     auto const now = [] {
@@ -461,23 +479,6 @@ TEST_CASE("a wait returns 0 when woken, 1 when time ran out, -1 for every other 
     }
 }
 
-namespace {
-
-struct Signal {
-    static void run(Event& event) { event.signal(); }
-};
-struct Reset {
-    static void run(Event& event) { event.reset(); }
-};
-struct Test {
-    static void run(Event& event) { event.test(); }
-};
-struct Wait {
-    static void run(Event& event) { event.wait(0); }
-};
-
-} // namespace
-
 TEST_CASE_TEMPLATE("every operation takes the event's mutex", Operation, Signal, Reset, Test,
                    Wait) {
     Event event(true);
@@ -517,37 +518,6 @@ TEST_CASE("a wait without limit does not use the timed wait") {
         CHECK(calls == 0);
     }
 }
-
-// ---- Cancellation
-
-namespace {
-
-/// 0 when a thread that is cancelled in its wait is unwound and leaves the event usable.
-int cancelledInWait(unsigned long timeout, bool cancelsItself) {
-    Event event(true);
-    std::atomic<long> threadId{0};
-    std::atomic<bool> returned{false};
-    bool const cancelled = test::endsCancelled(
-        [&] {
-            if (cancelsItself) ::pthread_cancel(::pthread_self());
-            threadId = ::syscall(SYS_gettid);
-            event.wait(timeout);
-            returned = true;
-        },
-        [&](pthread_t thread) {
-            if (cancelsItself) return;
-            while (threadId == 0 || !sleeps(threadId)) ::usleep(1000);
-            ::usleep(50000);
-            ::pthread_cancel(thread);
-        });
-    if (!cancelled || returned) return 1;
-    if (!usable(event)) return 2;
-    bool elsewhere = false;
-    std::thread([&] { elsewhere = usable(event); }).join();
-    return elsewhere ? 0 : 3;
-}
-
-} // namespace
 
 TEST_CASE("a thread that is cancelled in its wait is unwound and leaves the event usable") {
     for (bool const cancelsItself : {false, true}) {

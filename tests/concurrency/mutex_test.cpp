@@ -125,8 +125,6 @@ TEST_CASE("a mutex is a POSIX mutex in size and has no virtual function") {
     CHECK(std::is_copy_assignable<Mutex>::value);
 }
 
-// ---- Locking and recursion
-
 TEST_CASE("a new mutex is free") { follow("ask free"); }
 
 TEST_CASE("one try suffices on a free mutex") { follow("lock held unlock free"); }
@@ -181,8 +179,6 @@ TEST_CASE("only one thread at a time is between lock and unlock") {
     CHECK_FALSE(met);
 }
 
-// ---- Time-out
-
 TEST_CASE("a time-out of 0 gives up without a try, even on a free mutex") {
     follow("untried free");
 }
@@ -230,8 +226,6 @@ TEST_CASE("without an argument lock waits as long as it takes") {
     checkWaiting([](Mutex& mutex) { mutex.lock(); }, 300000);
 }
 
-// ---- isLocked and unlock
-
 TEST_CASE("isLocked says whether another thread holds the mutex, so the holder sees false") {
     Mutex mutex;
     follow(mutex, "lock ask held unlock");
@@ -251,8 +245,6 @@ TEST_CASE("unlock without holding does nothing") { follow("unlock free lock unlo
 TEST_CASE("unlock by another thread leaves the holder's lock alone") {
     follow("lock unlock-elsewhere held unlock free");
 }
-
-// ---- Copying and assigning
 
 TEST_CASE("a copy of a free mutex is a free recursive mutex of its own") {
     Mutex mutex;
@@ -312,8 +304,6 @@ TEST_CASE("assigning a mutex to itself leaves it as held as it was") {
     mutex = itself;
     follow(mutex, "free");
 }
-
-// ---- Cancellation
 
 TEST_CASE("a thread that is cancelled while it polls is unwound and holds nothing") {
     CHECK(test::ending([] {

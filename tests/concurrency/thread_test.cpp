@@ -239,8 +239,6 @@ std::string callsOf(std::string const& script) {
     return sequence;
 }
 
-// ---- Aborted threads
-
 /// What an aborted thread does, with a flag to raise when it has begun.
 using Body = std::function<void(std::atomic<bool>&)>;
 
@@ -335,8 +333,6 @@ TEST_CASE("the base's run returns null and its stop does nothing") {
     CHECK(calls.sequence == "create join ");
 }
 
-// ---- start
-
 TEST_CASE("start runs the derived class's run on a thread of its own, with the argument") {
     SystemCalls calls;
     unsigned long inside = 0;
@@ -408,8 +404,6 @@ TEST_CASE("what is written before start is there for run, and what run writes af
     CHECK(adder.sum == 500500);
 }
 
-// ---- join, detach and abort of threads that end by themselves
-
 TEST_CASE("join waits for the thread and returns what run returned") {
     int object = 0;
     for (void* const value : {static_cast<void*>(nullptr), static_cast<void*>(&object), ALL_BITS,
@@ -480,8 +474,6 @@ TEST_CASE("a running thread is detached once, before its start or after, and the
         untilThreadsAre(threads);
     }
 }
-
-// ---- The end of a thread
 
 TEST_CASE("the destructor neither joins nor detaches nor cancels the thread") {
     SystemCalls calls;
@@ -604,8 +596,6 @@ TEST_CASE("stop reaches the derived class's way to ask run to return") {
     CHECK(stoppable.asked.test());
 }
 
-// ---- Identifiers and sleep
-
 TEST_CASE("the current thread's identifier is that of POSIX and tells threads apart") {
     CHECK(Koru::Thread::getCurrentThreadId() == ::pthread_self());
     CHECK(Koru::Thread::getCurrentThreadId() == Koru::Thread::getCurrentThreadId());
@@ -704,8 +694,6 @@ TEST_CASE("a signal ends sleep early") {
               return Clock::now() - before < std::chrono::seconds(100) ? 0 : 3;
           }) == "exit 0");
 }
-
-// ---- abort
 
 TEST_CASE("abort cancels the thread, detaches it, and is done with it") {
     checkAborted([](std::atomic<bool>& begun) { begun = true; });

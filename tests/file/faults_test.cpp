@@ -113,13 +113,15 @@ bool cancelledAt(long point, Step step) {
         [](pthread_t) {});
 }
 
+void cancelAfterAWhile(pthread_t thread) {
+    ::usleep(20000);
+    ::pthread_cancel(thread);
+}
+
 } // namespace
 
-// ---- Failing to open
-
-TEST_CASE_FIXTURE(
-    Place,
-    "a file that cannot be opened for a passing reason is tried once and keeps its content") {
+TEST_CASE_FIXTURE(Place, "a file that cannot be opened for a passing reason is tried once and "
+                         "keeps its content") {
     writeFile(path, "content");
     forPassingReasons([&](int error) {
         for (unsigned long const mode : {READ, WRITE, READ_WRITE}) {
@@ -267,8 +269,6 @@ TEST_CASE_TEMPLATE("close without memory for a stream writes the new file withou
     CHECK(stored.isNew());
 }
 
-// ---- Cancellation
-
 TEST_CASE_TEMPLATE("a thread cancelled while it opens a file leaves the content, wherever that is",
                    Family, Sectioned, Flat, Records) {
     Stored<Family> const stored;
@@ -324,15 +324,6 @@ TEST_CASE_TEMPLATE("a thread cancelled in synchronize or close leaves the old co
     }
 }
 
-namespace {
-
-void cancelAfterAWhile(pthread_t thread) {
-    ::usleep(20000);
-    ::pthread_cancel(thread);
-}
-
-} // namespace
-
 TEST_CASE_TEMPLATE("a thread that waits for a writer to a pipe can be cancelled", Family, Sectioned,
                    Flat, Records) {
     Place const place;
@@ -363,8 +354,6 @@ TEST_CASE_TEMPLATE("a thread cancelled while it waits for the lock changes neith
           }) == "exit 0");
     CHECK(stored.isNew(4));
 }
-
-// ---- Streams that throw
 
 TEST_CASE_TEMPLATE("where the stream throws while it is read, what came before is held", Family,
                    Sectioned, Flat, Records) {
@@ -406,8 +395,6 @@ TEST_CASE_TEMPLATE("a last line that the end of the file cuts off is lost where 
     CHECK(test::sizeOf<Family>(file) == 2);
 }
 
-// ---- Flushing and seeking
-
 TEST_CASE_TEMPLATE("a file that cannot be gone back in is no empty file", Family, Sectioned, Flat,
                    Records) {
     Stored<Family> const stored;
@@ -442,8 +429,6 @@ TEST_CASE_TEMPLATE("output that cannot be written out is a failure to read the f
     CHECK(file.is_open());
     file.setMode(0);
 }
-
-// ---- Memory
 
 TEST_CASE_TEMPLATE("a size that the system claims is only a guess", Family, Sectioned, Flat) {
     int const count = 200000; // more than the first piece of memory holds

@@ -11,15 +11,16 @@
 #include <chrono>
 #include <fstream>
 #include <future>
+#include <memory>
 #include <stdexcept>
-#include <string>
-#include <thread>
+#include <type_traits>
 
 #include <doctest/doctest.h>
 
 #include "file/filefixture.h"
 #include "support/cancellation.h"
 #include "support/holder.h"
+#include "support/sleeping.h"
 #include "support/subprocess.h"
 
 #if defined(__SANITIZE_THREAD__)
@@ -59,12 +60,26 @@ using test::OnContent;
 using test::OnFile;
 using test::READ;
 
+std::chrono::seconds const NO_TIME(0);
 std::future_status const READY = std::future_status::ready;
 std::future_status const TIMEOUT = std::future_status::timeout;
 
 template <class Callable>
 auto async(Callable callable) {
     return std::async(std::launch::async, callable);
+}
+
+/// Starts a call on another thread and returns when it waits for something there.
+template <class Callable>
+std::future<void> waiting(Callable callable) {
+    auto const threadId = std::make_shared<std::atomic<long>>(0);
+    std::future<void> result = async([threadId, callable] {
+        *threadId = test::ownThreadId();
+        callable();
+    });
+    test::untilSleeping(*threadId, [&] { return result.wait_for(NO_TIME) == READY; });
+    REQUIRE(result.wait_for(NO_TIME) == TIMEOUT);
+    return result;
 }
 
 /// What takes the file's lock.
@@ -182,8 +197,7 @@ TEST_CASE_TEMPLATE("open, close and synchronize wait for the lock and release it
     OnContent on;
     if (!std::is_same<Operation, Open>::value) on.file.open(READ);
     Holder holder(on.file);
-    std::future<void> done = async([&] { Operation::run(on.file); });
-    CHECK(done.wait_for(test::SHORT_WHILE) == TIMEOUT);
+    std::future<void> done = waiting([&] { Operation::run(on.file); });
     holder.letGo();
     CHECK(done.wait_for(test::LONG_WHILE) == READY);
     done.get();
@@ -204,8 +218,7 @@ TEST_CASE_FIXTURE(OnFile, "the thread that holds the lock can open, close and sy
 }
 
 TEST_CASE_FIXTURE(OnPipe, "open holds the lock as long as the system takes to open the file") {
-    std::future<void> opened = async([&] { file.open(READ); });
-    REQUIRE(opened.wait_for(test::SHORT_WHILE) == TIMEOUT);
+    std::future<void> opened = waiting([&] { file.open(READ); });
     CHECK(keepsWaiting(file, [&] {
         std::ofstream const writer(path); // The reader gets on when there is one.
         opened.get();
@@ -222,8 +235,7 @@ TEST_CASE_FIXTURE(OnPipe, "close holds the lock as long as writing out takes") {
 
     file.open(test::WRITE);
     file << "one more";
-    std::future<void> closed = async([&] { file.close(); });
-    REQUIRE(closed.wait_for(test::SHORT_WHILE) == TIMEOUT);
+    std::future<void> closed = waiting([&] { file.close(); });
     CHECK(keepsWaiting(file, [&] {
         while (::read(end, page, sizeof page) > 0 ||
                closed.wait_for(std::chrono::milliseconds(1)) != READY)

@@ -129,8 +129,6 @@ struct OnRecorder : OnContent {
 
 } // namespace
 
-// ---- The class
-
 TEST_CASE("the mode bits are integral constants that can be combined") {
     static_assert(File::READ == 0x00000001UL, "");
     static_assert(File::WRITE == 0x00000002UL, "");
@@ -212,8 +210,6 @@ TEST_CASE("the virtual functions of an initialization file follow those of the f
     CHECK(slotOf(&InitializationFile::setValue) == 14);
 }
 
-// ---- How the file classes meet a caller's code
-
 TEST_CASE_TEMPLATE("a path converts to the file that is there", Object, DataFile,
                    InitializationFile, PropertyFile, LogFile) {
     static_assert(std::is_convertible<File::Path, Object>::value, "");
@@ -274,8 +270,6 @@ TEST_CASE_FIXTURE(OnContent, "the mode and the name may be asked for and the mod
     other.join();
 }
 
-// ---- Construction, name and mode
-
 TEST_CASE_FIXTURE(OnFile, "a new file is closed, in mode 0 and in a good state") {
     File nameless;
     CHECK(nameless.getName() == L"");
@@ -332,8 +326,6 @@ TEST_CASE("name and mode can be asked and set while another thread holds the loc
     CHECK(file.getMode() == 7);
     CHECK(file.getName() == L"/a/b");
 }
-
-// ---- open
 
 TEST_CASE("open opens, creates, empties or fails as its mode says") {
     struct {
@@ -481,8 +473,8 @@ TEST_CASE_FIXTURE(OnFile, "attempts that fail add the fail state") {
     }
 }
 
-TEST_CASE_FIXTURE(
-    OnFile, "a file that could not be opened can be opened later, and stays in the fail state") {
+TEST_CASE_FIXTURE(OnFile, "a file that could not be opened can be opened later, and stays in the "
+                          "fail state") {
     CHECK(after(*this, "not-read store read") == "open, mode 1, fail: content");
     file.clear();
     CHECK(contentOf(file) == "content");
@@ -529,8 +521,6 @@ TEST_CASE_FIXTURE(OnFile, "open and close set the mode themselves, whatever an o
     CHECK(stubborn.getMode() == 0);
 }
 
-// ---- close
-
 TEST_CASE_FIXTURE(OnFile, "close writes out what is buffered, closes and resets the mode") {
     CHECK(after(*this, "write put") == "open, mode 2, good: ");
     CHECK(after(*this, "close") == "closed, mode 0, good: content");
@@ -548,8 +538,8 @@ TEST_CASE_FIXTURE(OnContent, "close leaves the state of the stream as it was") {
     }
 }
 
-TEST_CASE_FIXTURE(
-    OnFile, "closing a file that was never opened sets the fail state and touches nothing else") {
+TEST_CASE_FIXTURE(OnFile, "closing a file that was never opened sets the fail state and touches "
+                          "nothing else") {
     CHECK(after(*this, "mode-write close") == "closed, mode 0, fail, no file");
     CHECK(after(*this, "store close") == "closed, mode 0, fail: content");
     CHECK(file.getName() == dir.wide("a"));
@@ -586,8 +576,6 @@ TEST_CASE("no descriptor stays open after close or destruction") {
     CHECK(descriptors() == before);
 }
 
-// ---- Stream exceptions, which a caller can enable
-
 TEST_CASE_FIXTURE(OnContent, "stream exceptions that a caller enables leave the lock released") {
     auto const check = [](File& target, bool isOpen, auto step) {
         target.exceptions(FAIL);
@@ -623,8 +611,6 @@ TEST_CASE_FIXTURE(OnContent, "stream exceptions that a caller enables leave the 
         check(file, false, [&] { file.synchronize(); });
     }
 }
-
-// ---- synchronize
 
 TEST_CASE_FIXTURE(OnRecorder, "synchronize closes and reopens through the virtual functions, under "
                               "the lock") {
@@ -712,8 +698,6 @@ TEST_CASE_FIXTURE(OnRecorder, "what an override throws comes out of synchronize,
     CHECK(recorder.calls == Strings{"close in mode 1", "close in mode 1", "open 1"});
     CHECK(shown(recorder) == CLOSED + ", good");
 }
-
-// ---- Destruction
 
 TEST_CASE_TEMPLATE("a file can be destroyed as the file or the stream that it is, and is written "
                    "out",

@@ -135,8 +135,6 @@ std::string naively(std::string const& directory, std::string const& text) {
     return plainly(resolved + joined.substr(end));
 }
 
-// ---- What a copy of this executable does with its arguments.
-
 /// Wide text as an argument of a program, so that NULs and units that are no characters get
 /// through.
 std::string hexadecimal(std::wstring const& text) {
@@ -282,6 +280,28 @@ struct AppIn : App {
         test::copyOwnExecutable(program);
     }
 };
+
+struct Renamed : Path {
+    using Path::Path;
+    std::wstring const& getName() const override { return other; }
+    void setName(std::wstring const& name) override { other = name; }
+    std::wstring other = L"other";
+};
+
+/// Lets each allocation of the assignment fail in turn and tells how many there are.
+template <class Source>
+long checkAssignment(Source const& source, Path const& expected) {
+    for (long before = 0;; ++before) {
+        CAPTURE(before);
+        Path path = pathOf(L"C:", L"/a/", L"b");
+        std::string const outcome =
+            test::runOutOfMemory(before, test::Failing::ONE, [&] { path = source; });
+        bool const done = !test::memoryRanOut();
+        CHECK(outcome == (done ? "done" : "std::bad_alloc"));
+        CHECK(shown(path) == (done ? shown(expected) : "C:|/a/|b"));
+        if (done) return before;
+    }
+}
 
 } // namespace
 
@@ -490,17 +510,6 @@ TEST_CASE("getters give references that stay valid and follow the setters") {
     CHECK(*parts[2] == L"d");
 }
 
-namespace {
-
-struct Renamed : Path {
-    using Path::Path;
-    std::wstring const& getName() const override { return other; }
-    void setName(std::wstring const& name) override { other = name; }
-    std::wstring other = L"other";
-};
-
-} // namespace
-
 TEST_CASE("the parts of a path can be overridden") {
     Renamed renamed;
     Path& path = renamed;
@@ -538,25 +547,6 @@ TEST_CASE("a refused text leaves the path it was to be assigned to as it was") {
     CHECK(test::messageOf<std::invalid_argument>([&] { path = ""; }) == EMPTY);
     CHECK(shown(path) == "/a/|b");
 }
-
-namespace {
-
-/// Lets each allocation of the assignment fail in turn and tells how many there are.
-template <class Source>
-long checkAssignment(Source const& source, Path const& expected) {
-    for (long before = 0;; ++before) {
-        CAPTURE(before);
-        Path path = pathOf(L"C:", L"/a/", L"b");
-        std::string const outcome =
-            test::runOutOfMemory(before, test::Failing::ONE, [&] { path = source; });
-        bool const done = !test::memoryRanOut();
-        CHECK(outcome == (done ? "done" : "std::bad_alloc"));
-        CHECK(shown(path) == (done ? shown(expected) : "C:|/a/|b"));
-        if (done) return before;
-    }
-}
-
-} // namespace
 
 TEST_CASE("when memory runs out, a path that is assigned to keeps all of its parts") {
     std::wstring const text = L"/" + std::wstring(100, L'd') + L"/" + std::wstring(100, L'n');
@@ -639,8 +629,6 @@ TEST_CASE("equality takes the parts that a path converts to, not what overrides 
     CHECK((renamed == Path(L"/a/b")));
     CHECK((renamed != Path(L"/a/other")));
 }
-
-// ---- Relative paths
 
 TEST_CASE_FIXTURE(App, "a relative path is joined to the executable's directory and resolved") {
     check({"conf/app.ini -> ~/bin/conf/|app.ini", "file.txt -> ~/bin/|file.txt",
@@ -817,8 +805,6 @@ TEST_CASE_FIXTURE(App, "a file is created where a dangling link leads to") {
     CHECK(test::readFile(dir / "bin/nowhere") == "here");
     CHECK(std::filesystem::is_symlink(dir / "bin/dangling"));
 }
-
-// ---- The executable and what it is called
 
 TEST_CASE_FIXTURE(App, "the executable's directory is the one its links lead to") {
     std::filesystem::create_directory(dir / "links");

@@ -126,6 +126,17 @@ private:
     }
 };
 
+struct Digits : std::numpunct<char> {
+    char do_thousands_sep() const override { return '.'; }
+    std::string do_grouping() const override { return "\1"; }
+};
+struct Output : std::num_put<char> {
+    iter_type do_put(iter_type at, std::ios_base&, char, void const*) const override {
+        *at++ = '!';
+        return at;
+    }
+};
+
 } // namespace
 
 TEST_CASE_FIXTURE(Folder, "exists is true of any kind of entry that can be reached") {
@@ -186,8 +197,6 @@ TEST_CASE_FIXTURE(Folder, "relative paths of the operations belong to the workin
     CHECK(!exists("u"));
 }
 
-// ---- rename
-
 TEST_CASE_FIXTURE(Folder, "rename moves a file and tells whether it is at its new place only") {
     CHECK(rename("a", "b") == "true -a b=content");
     CHECK(rename("b", "d/c") == "true -b d/c=content");
@@ -227,8 +236,6 @@ TEST_CASE_FIXTURE(Folder, "rename moves a link, and is false where that dangles"
     CHECK(rename("link", "moved") == "true -link moved=link");
     CHECK(rename("dangling", "moved too") == "false -dangling moved too=link");
 }
-
-// ---- remove
 
 TEST_CASE_FIXTURE(Folder, "remove deletes files, empty directories and links") {
     pipe("pipe");
@@ -286,8 +293,6 @@ TEST_CASE_FIXTURE(Folder,
     CHECK(permissions("b") == 0600);
 }
 
-// ---- copy
-
 TEST_CASE_FIXTURE(Folder, "copy writes the text of a pointer, never the bytes of the source") {
     for (std::string const& content : {std::string(), std::string("content"), std::string("0"),
                                        std::string(100000, 'c'), std::string("\0\r\n\xFF", 4)}) {
@@ -338,21 +343,6 @@ TEST_CASE_FIXTURE(Folder, "copy gives its target the permissions of any new file
     CHECK(permissions("a") == 0751);
 }
 
-namespace {
-
-struct Digits : std::numpunct<char> {
-    char do_thousands_sep() const override { return '.'; }
-    std::string do_grouping() const override { return "\1"; }
-};
-struct Output : std::num_put<char> {
-    iter_type do_put(iter_type at, std::ios_base&, char, void const*) const override {
-        *at++ = '!';
-        return at;
-    }
-};
-
-} // namespace
-
 TEST_CASE_TEMPLATE("what copy writes does not depend on the global locale", Facet, Digits, Output) {
     Folder const folder;
     std::locale const before = std::locale::global(std::locale(std::locale::classic(), new Facet));
@@ -362,8 +352,6 @@ TEST_CASE_TEMPLATE("what copy writes does not depend on the global locale", Face
     CHECK(copied == "true b=<pointer>");
     CHECK(missing == "false c=<null>");
 }
-
-// ---- create
 
 TEST_CASE_FIXTURE(Folder, "create makes an empty file") {
     write("new", "");
