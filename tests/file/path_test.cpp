@@ -72,7 +72,7 @@ std::string parsedInEveryKind(std::string const& text) {
     return parts;
 }
 
-/// A row of a table: a text and, behind an arrow, how it is parsed.
+/// A row of a table: a text, an arrow and how the text is parsed.
 std::pair<std::string, std::string> cells(std::string const& row) {
     std::size_t const arrow = row.find(" -> ");
     return {row.substr(0, arrow), row.substr(arrow + 4)};
