@@ -62,7 +62,7 @@ std::string complaint(Callable callable) {
 template <class Callable>
 void forPassingReasons(Callable callable) {
     for (int const error : {EMFILE, ENFILE, ENOMEM, EINTR, EIO, EACCES, ELOOP}) {
-        CAPTURE(std::strerror(error));
+        INFO(std::string(std::strerror(error)));
         callable(error);
     }
 }
@@ -143,7 +143,7 @@ TEST_CASE_FIXTURE(Place, "a file that cannot be opened for a passing reason is t
 
 TEST_CASE_FIXTURE(Place, "a missing file is tried twice, and so is a link that leads nowhere") {
     std::filesystem::create_symlink(directory / "target", directory / "link");
-    for (char const* const name : {"missing", "link"}) {
+    for (std::string const name : {"missing", "link"}) {
         CAPTURE(name);
         Koru::File file(directory.wide(name));
         FailingCall const counter(Call::OPEN, 0, 1000);

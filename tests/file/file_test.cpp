@@ -329,7 +329,7 @@ TEST_CASE("name and mode can be asked and set while another thread holds the loc
 
 TEST_CASE("open opens, creates, empties or fails as its mode says") {
     struct {
-        char const* label;
+        std::string label;
         unsigned long mode;
         char const* before; ///< content of the file, null for none
         bool opens;
@@ -744,7 +744,7 @@ TEST_CASE_FIXTURE(OnFile, "the destructor of a closed file touches nothing") {
 
 TEST_CASE("the destructor lets no exception out") {
     struct {
-        char const* label;
+        std::string label;
         wchar_t const* name;
         bool closed;
     } const rows[] = {{"a file that cannot be written out", L"/dev/full", false},

@@ -53,12 +53,30 @@ std::string shown(Path const& path) {
            make_string(path.getName());
 }
 
+bool filesAreRefused = false;
+
+/// The path of a text. Meanwhile no file can be opened, if that was asked for, so nothing says
+/// where the executable is. (The sanitizers open some themselves before and after.)
+template <class Text>
+Path made(Text const& text) {
+    struct Limit {
+        Limit() {
+            ::getrlimit(RLIMIT_NOFILE, &before);
+            rlimit const none{0, before.rlim_max};
+            if (filesAreRefused) ::setrlimit(RLIMIT_NOFILE, &none);
+        }
+        ~Limit() { ::setrlimit(RLIMIT_NOFILE, &before); }
+        rlimit before{};
+    } const limit;
+    return Path(text);
+}
+
 /// How a text is parsed: the parts, or the message of the exception.
 template <class Text>
 std::string parsed(Text const& text) {
     std::string parts;
     std::string const message =
-        test::messageOf<std::invalid_argument>([&] { parts = shown(Path(text)); });
+        test::messageOf<std::invalid_argument>([&] { parts = shown(made(text)); });
     return parts.empty() ? message : parts;
 }
 
@@ -150,19 +168,9 @@ std::wstring fromHexadecimal(std::string const& argument) {
     return text;
 }
 
-bool filesAreRefused = false;
-
-/// Answers with how a text is parsed. No file can be opened meanwhile, if that was asked for, so
-/// nothing says where the executable is. (The sanitizers open some themselves before and after.)
 template <class Text>
 bool answerWith(Text const& text) {
-    rlimit before{};
-    ::getrlimit(RLIMIT_NOFILE, &before);
-    rlimit const none{0, before.rlim_max};
-    if (filesAreRefused) ::setrlimit(RLIMIT_NOFILE, &none);
-    std::string const parts = parsed(text);
-    ::setrlimit(RLIMIT_NOFILE, &before);
-    test::answer(parts);
+    test::answer(parsed(text));
     return true;
 }
 
@@ -403,7 +411,7 @@ TEST_CASE("every short absolute path is split as the plain rule says") {
 }
 
 TEST_CASE("a path without a directory below the root cannot be represented") {
-    for (char const* text : {"/x.txt", "/", "//", "///x", "/\\", "/\\x", "/.", "/.."}) {
+    for (std::string const text : {"/x.txt", "/", "//", "///x", "/\\", "/\\x", "/.", "/.."}) {
         CAPTURE(text);
         CHECK(parsedInEveryKind(text) == UNDETERMINED);
     }
@@ -766,7 +774,7 @@ TEST_CASE_FIXTURE(App, "every short relative path gives what resolving it piece 
 }
 
 TEST_CASE_FIXTURE(App, "any number of components may be missing") {
-    auto const checkLong = [&](char const* start, std::string expected, int count) {
+    auto const checkLong = [&](std::string const& start, std::string expected, int count) {
         for (int i = 0; i < count; ++i) expected += "m/";
         Strings const arguments{start, std::to_string(count)};
         CAPTURE(start);
@@ -810,7 +818,7 @@ TEST_CASE_FIXTURE(App, "the executable's directory is the one its links lead to"
     std::filesystem::create_directory(dir / "links");
     link("../bin/prog", "links/prog");
     link("../bin", "links/bin");
-    for (char const* name : {"links/prog", "links/bin/prog"}) {
+    for (std::string const name : {"links/prog", "links/bin/prog"}) {
         CAPTURE(name);
         program = dir / name;
         CHECK(ask(program, "/", {"conf/app.ini", "x/y"}) ==
@@ -868,9 +876,9 @@ TEST_CASE_FIXTURE(App, "a relative path is refused when neither executable nor w
                        "can be told") {
     std::string const gone = dir / "gone";
     Strings const texts{"x.ini", "conf/app.ini", "../bin/conf/app.ini", ".", "\\"};
-    for (char const* argv0 : {"", "prog", "./prog", "../bin/prog"}) {
+    for (std::string const argv0 : {"", "prog", "./prog", "../bin/prog"}) {
         for (Strings arguments : {Strings{"RMDIR=" + gone}, {"RMDIR=" + gone, "WITHOUT_FILES"}}) {
-            INFO(argv0, arguments.back());
+            INFO("as ", argv0, ", ", arguments.back());
             std::filesystem::create_directory(gone);
             arguments.insert(arguments.end(), texts.begin(), texts.end());
             CHECK(ask(argv0, gone, arguments) == Strings(texts.size(), UNDETERMINED));

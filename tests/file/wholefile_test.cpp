@@ -143,7 +143,7 @@ TEST_CASE_FIXTURE(Folder, "exists is true of any kind of entry that can be reach
     write("without permissions", "content");
     permit("without permissions", 0);
     pipe("pipe");
-    for (char const* name :
+    for (std::string const name :
          {"a", "without permissions", "d", "d/", "d/.", "pipe", "link", "link-to-d/"}) {
         CAPTURE(name);
         CHECK(exists(name));
@@ -259,7 +259,7 @@ TEST_CASE_FIXTURE(Folder, "remove deletes what is read-only") {
 }
 
 TEST_CASE_FIXTURE(Folder, "remove of what is missing is true") {
-    for (char const* name : {"none", "none/none", "a/none", "a/", ""}) {
+    for (std::string const name : {"none", "none/none", "a/none", "a/", ""}) {
         CAPTURE(name);
         CHECK(remove(name) == "true");
     }
