@@ -15,8 +15,8 @@ namespace test {
 /// Made on construction, removed with its content on destruction.
 class TempDir {
 public:
-    explicit TempDir(std::string const& parent = std::filesystem::temp_directory_path().string()) {
-        std::string name = parent + "/koru-test-XXXXXX";
+    TempDir() {
+        std::string name = std::filesystem::temp_directory_path().string() + "/koru-test-XXXXXX";
         if (::mkdtemp(&name[0]) == nullptr) throw std::runtime_error("mkdtemp failed");
         path_ = std::filesystem::canonical(name).string();
     }
