@@ -204,12 +204,9 @@ TEST_CASE("files are read entry by entry, and what is wrong ends the reading") {
 }
 
 TEST_CASE("the NUL that ends an odd key is written, so the key grows to an even length") {
-    Place const place;
-    place.write("\3\0\0\0\0ax\1\0\0\0d"s);
-    DataFile file(place.path());
-    file.open(READ_WRITE);
+    OwnDataFile file("\3\0\0\0\0ax\1\0\0\0d"s, READ_WRITE);
     file.close();
-    CHECK(place.bytes() == "\4\0\0\0\0a\0\0\1\0\0\0d"s);
+    CHECK(file.bytes() == "\4\0\0\0\0a\0\0\1\0\0\0d"s);
 }
 
 TEST_CASE("characters that do not survive in a key do so at the second reading") {
@@ -293,9 +290,7 @@ TEST_CASE("large data and long keys survive writing and reading") {
 }
 
 TEST_CASE("synchronize of records that cannot be read again keeps those before") {
-    Place const place;
-    DataFile file(place.path());
-    file.open(READ_WRITE);
+    OwnDataFile file(READ_WRITE);
     file.insert(record(L"k"));
     file.insert(record(L"l"));
     Entries const entries = held(file);
@@ -304,7 +299,7 @@ TEST_CASE("synchronize of records that cannot be read again keeps those before")
     CHECK(file.is_open());
     checkSame(held(file), {entries[0]});
     CHECK(isFree(file));
-    CHECK(place.bytes() == fileBytes({entries[0], entry(L"")}));
+    CHECK(file.bytes() == fileBytes({entries[0], entry(L"")}));
 }
 
 namespace {

@@ -90,17 +90,14 @@ TEST_CASE("when memory runs out in synchronize, the old file or the new one is t
 }
 
 TEST_CASE("when memory runs out before the old file is deleted, the records are still held") {
-    Place const place;
-    place.write(fileBytes(numbered(L"k", 70, 10)));
-    DataFile file(place.path());
-    file.open(READ_WRITE);
+    OwnDataFile file(fileBytes(numbered(L"k", 70, 10)), READ_WRITE);
     file.insert(record(L"new"));
     Entries const entries = held(file);
     REQUIRE(runOutOfMemory({0}, [&] { file.close(); }) == "std::bad_alloc");
     CHECK(file.is_open());
     checkSame(held(file), entries);
     file.close();
-    CHECK(place.bytes() == fileBytes(entries));
+    CHECK(file.bytes() == fileBytes(entries));
 }
 
 TEST_CASE("when memory runs out in the destructor, the process goes on and no file is cut") {

@@ -81,8 +81,6 @@ Record randomRecord(Chance& chance, std::size_t mostData) {
 /// the positions.
 class Pair {
 public:
-    Pair() : file_(place_.path()) { file_.open(READ_WRITE); }
-
     void insert(Record const& record) {
         bool const isNew = find(record.getKey()) == records_.end();
         file_.insert(record);
@@ -117,7 +115,7 @@ public:
         Loaded const reloaded = load(content);
         std::string const message = messageOf<std::exception>([&] { file_.synchronize(); });
         CHECK((message == "<nothing>") == (reloaded.message == "<nothing>"));
-        bool const same = place_.bytes() == content;
+        bool const same = file_.bytes() == content;
         CHECK(same);
         records_.clear();
         for (unsigned long i = 0; i < file_.size(); ++i) {
@@ -139,7 +137,7 @@ public:
 
     void close() {
         file_.close();
-        bool const same = place_.bytes() == fileBytes(expected());
+        bool const same = file_.bytes() == fileBytes(expected());
         CHECK(same);
     }
 
@@ -159,8 +157,7 @@ private:
         return result;
     }
 
-    Place place_;
-    DataFile file_;
+    OwnDataFile file_{READ_WRITE};
     Held records_;
 };
 
@@ -187,12 +184,10 @@ TEST_CASE("any sequence of operations gives what the model gives, position by po
 }
 
 TEST_CASE("records that nobody looks at are inserted and removed as the model says") {
-    Place const place;
     for (std::uint32_t seed = 100; seed < 110; ++seed) {
         CAPTURE(seed);
         Chance chance(seed);
-        DataFile file(place.path());
-        file.open(WRITE);
+        OwnDataFile file(WRITE);
         Entries model; // no two with equal keys, so the order does not matter
         for (int step = 0; step < 1500; ++step) {
             Record const record = randomRecord(chance, 300);
@@ -211,7 +206,7 @@ TEST_CASE("records that nobody looks at are inserted and removed as the model sa
         CHECK(model.size() > 100);
         if (seed % 2 == 0) checkSameRecords(held(file), model);
         file.close();
-        std::string const content = place.bytes();
+        std::string const content = file.bytes();
         CHECK(content.size() == fileBytes(model).size());
         for (Entry const& e : model) {
             if (content.find(fileBytes(e)) == std::string::npos) checkSame({e}, {});

@@ -191,12 +191,9 @@ TEST_CASE("records are copied member by member, without checks, and apart from t
 }
 
 TEST_CASE("positions follow the addresses of the records, whatever was done before") {
-    Place const place;
     for (int const count : {0, 1, 2, 63, 64, 65, 127, 128, 129, 500, 2000}) {
         CAPTURE(count);
-        place.write(fileBytes(numberedEntries(count)));
-        DataFile file(place.path());
-        file.open(READ_WRITE);
+        OwnDataFile file(fileBytes(numberedEntries(count)), READ_WRITE);
         CHECK(isInOrderOfAddresses(file));
         for (int i = 0; i < count; i += 3) file.remove(record(numbered(i)));
         CHECK(isInOrderOfAddresses(file));
@@ -238,20 +235,17 @@ TEST_CASE("a record stays where it is until it is removed, whatever happens to o
 }
 
 TEST_CASE("records are written in the order of their positions") {
-    Place const place;
-    DataFile file(place.path());
-    file.open(WRITE);
+    OwnDataFile file(WRITE);
     insertNumbered(file, 300);
     for (int i = 0; i < 300; i += 4) file.remove(record(numbered(i)));
     for (int i = 0; i < 300; i += 8) file.insert(record(numbered(i), "again"));
     Entries const entries = held(file);
     file.close();
-    checkSame(load(place.bytes()).entries, entries);
+    checkSame(load(file.bytes()).entries, entries);
 }
 
 TEST_CASE("a position after the last is refused") {
-    Place const place;
-    DataFile file(place.path());
+    OwnDataFile file;
     for (unsigned long const index : {0UL, 1UL, ULONG_MAX}) CHECK(isNoPosition(file, index));
     file.open(WRITE);
     CHECK(isNoPosition(file, 0));
@@ -283,9 +277,7 @@ TEST_CASE("a record with an equal key is not inserted, and the one held stays as
 }
 
 TEST_CASE("keys count up to their first NUL where they are compared, and in full where written") {
-    Place const place;
-    DataFile file(place.path());
-    file.open(READ_WRITE);
+    OwnDataFile file(READ_WRITE);
     file.insert(record(L"a\0b"s, "first"));
     file.insert(record(L"A", "second"));
     file.insert(record(L"a\0c"s, "third"));
@@ -317,15 +309,12 @@ TEST_CASE("a default record can be inserted once, and removed") {
 }
 
 TEST_CASE("remove removes the first record of an equal key, and nothing without one") {
-    Place const place;
     Entries stored;
     for (int i = 0; i < 10; ++i) {
         stored.push_back(entry(i % 2 == 0 ? L"Name" : L"nAME", std::to_string(i)));
         stored.push_back(entry(L"other " + std::to_wstring(i)));
     }
-    place.write(fileBytes(stored));
-    DataFile file(place.path());
-    file.open(READ);
+    OwnDataFile file(fileBytes(stored), READ);
     Entries expected = held(file);
     REQUIRE(expected.size() == 20);
     for (int i = 0; i < 12; ++i) {
@@ -355,9 +344,7 @@ TEST_CASE("a held record may itself be the argument") {
 }
 
 TEST_CASE("changes through a reference are changes of the record held") {
-    Place const place;
-    DataFile file(place.path());
-    file.open(READ_WRITE);
+    OwnDataFile file(READ_WRITE);
     file.insert(record(L"key", "data"));
     file[0].setKey(L"  new ");
     file[0].setData(bytes("new data"));
@@ -366,7 +353,7 @@ TEST_CASE("changes through a reference are changes of the record held") {
     checkSame(held(file), {entry(L"new", "new data")});
     file[0] = record(L"assigned", "as a whole");
     file.close();
-    CHECK(place.bytes() == fileBytes(entry(L"assigned", "as a whole")));
+    CHECK(file.bytes() == fileBytes(entry(L"assigned", "as a whole")));
 }
 
 namespace {
@@ -542,10 +529,7 @@ TEST_CASE("of many records the equal one is found, and only that") {
         for (int i = 0; i < end; i += step) records.push_back(record(prefix + std::to_wstring(i)));
         return records;
     };
-    Place const place;
-    place.write(fileBytes(numberedEntries(count)));
-    DataFile file(place.path());
-    file.open(READ);
+    OwnDataFile file(fileBytes(numberedEntries(count)), READ);
     CHECK(file.size() == static_cast<unsigned long>(count));
     for (Record const& r : each(L"KEY ", count, 7)) file.insert(r);
     CHECK(file.size() == static_cast<unsigned long>(count));
@@ -559,9 +543,7 @@ TEST_CASE("of many records the equal one is found, and only that") {
 }
 
 TEST_CASE("an exception of the record file's own leaves the lock free") {
-    Place const place;
-    DataFile file(place.path());
-    file.open(READ_WRITE);
+    OwnDataFile file(READ_WRITE);
     CHECK(isNoPosition(file, 0));
     CHECK(isFree(file));
     file.insert(Record());
@@ -569,8 +551,8 @@ TEST_CASE("an exception of the record file's own leaves the lock free") {
     CHECK(isFree(file));
     CHECK(complaintAboutKey([&] { file.open(READ_WRITE); }) == NO_KEY);
     CHECK(isFree(file));
-    std::filesystem::remove(place.path());
-    std::filesystem::create_directories(place.path() + "/content");
+    std::filesystem::remove(file.place.path());
+    std::filesystem::create_directories(file.place.path() + "/content");
     CHECK(messageOf<std::runtime_error>([&] { file.close(); }) == "failed to open file.");
     CHECK(isFree(file));
 }

@@ -21,6 +21,7 @@
 #include <koru/logfile.h>
 #include <koru/string.h>
 
+#include "support/ownfile.h"
 #include "support/selfexec.h"
 #include "support/slots.h"
 #include "support/subprocess.h"
@@ -32,6 +33,7 @@ using Koru::LogFile;
 using test::Place;
 using test::slotOf;
 using test::toldByChild;
+using OwnLog = test::OwnFile<LogFile>;
 using namespace std::string_literals;
 
 namespace {
@@ -129,7 +131,6 @@ TEST_CASE("opening for writing alone empties a log, for reading and writing keep
         unsigned int mode;
         std::string kept;
     };
-    Place const place;
     for (Row const& row : std::vector<Row>{
              {"writing", WRITE, ""},
              {"reading and writing", READ_WRITE, "before\n"},
@@ -139,40 +140,35 @@ TEST_CASE("opening for writing alone empties a log, for reading and writing keep
              {"reading and writing, other bits", 0x7FFFFFFFU, "before\n"},
          }) {
         CAPTURE(row.label);
-        place.write("before\n");
-        LogFile log(place.path());
-        log.open(row.mode);
+        OwnLog log("before\n", row.mode);
         CHECK(log.is_open());
         CHECK(log.good());
         CHECK(log.getMode() == 0UL);
-        CHECK(place.bytes() == row.kept);
+        CHECK(log.bytes() == row.kept);
         put(log, "after\n");
         log.close();
-        CHECK(place.bytes() == row.kept + "after\n");
+        CHECK(log.bytes() == row.kept + "after\n");
         CHECK(isClosed(log));
     }
 }
 
 TEST_CASE("either mode creates a missing log") {
     for (unsigned int const mode : {WRITE, READ_WRITE}) {
-        Place const place;
-        LogFile log(place.path());
-        log.open(mode);
-        CHECK(place.bytes() == "");
+        OwnLog log(mode);
+        CHECK(log.bytes() == "");
         putNow(log, "line\n");
-        CHECK(place.bytes() == "line\n");
+        CHECK(log.bytes() == "line\n");
     }
 }
 
 TEST_CASE("output follows that of earlier openings") {
-    Place const place;
+    OwnLog log;
     std::string expected;
-    LogFile log(place.path());
     for (int i = 0; i < 20; ++i) {
         std::string const line = "line " + std::to_string(i) + "\n";
         openPutAndClose(log, READ_WRITE, line);
         expected += line;
-        CHECK(place.bytes() == expected);
+        CHECK(log.bytes() == expected);
     }
 }
 
@@ -198,57 +194,46 @@ TEST_CASE("output before close, before destruction and before a flush is in the 
 }
 
 TEST_CASE("nothing is added to what the caller writes") {
-    Place const place;
     std::string text;
     for (int i = 0; i < 256; ++i) text += static_cast<char>(i);
     text += std::string(3UL * LogFile::MAX_LINE_LENGTH, 'l'); // no limit is imposed
-    LogFile log(place.path());
+    OwnLog log;
     for (std::string const& written : {""s, text}) {
         openPutAndClose(log, WRITE, written);
-        CHECK(place.bytes() == written);
+        CHECK(log.bytes() == written);
     }
 }
 
 TEST_CASE("seeking does not move where output goes") {
-    Place const place;
-    place.write("before\n");
-    LogFile log(place.path());
-    log.open(READ_WRITE);
+    OwnLog log("before\n", READ_WRITE);
     log.seekp(0);
     putNow(log, "one\n");
     log.seekp(2);
     put(log, "two\n");
     log.close();
-    CHECK(place.bytes() == "before\none\ntwo\n");
+    CHECK(log.bytes() == "before\none\ntwo\n");
 }
 
 TEST_CASE("a log cannot be read, whatever its mode was") {
-    Place const place;
-    place.write("before\n");
-    LogFile log(place.path());
-    log.open(READ_WRITE);
+    OwnLog log("before\n", READ_WRITE);
     log.seekg(0);
     CHECK(log.rdbuf()->sgetc() == std::char_traits<char>::eof());
 }
 
 TEST_CASE("what others write or delete meanwhile does not hide output") {
-    Place const place;
-    LogFile log(place.path());
-    log.open(WRITE);
+    OwnLog log(WRITE);
     putNow(log, "one\n");
-    std::ofstream(place.path(), std::ios::app) << "other\n";
+    std::ofstream(log.place.path(), std::ios::app) << "other\n";
     putNow(log, "two\n");
-    CHECK(place.bytes() == "one\nother\ntwo\n");
-    std::filesystem::resize_file(place.path(), 0);
+    CHECK(log.bytes() == "one\nother\ntwo\n");
+    std::filesystem::resize_file(log.place.path(), 0);
     putNow(log, "three\n");
-    CHECK(place.bytes() == "three\n");
+    CHECK(log.bytes() == "three\n");
 }
 
 TEST_CASE("two logs of one file append by turns") {
-    Place const place;
-    LogFile a(place.path());
-    LogFile b(place.path());
-    a.open(WRITE);
+    OwnLog a(WRITE);
+    LogFile b(a.place.path());
     b.open(READ_WRITE);
     std::string expected;
     for (int i = 0; i < 50; ++i) {
@@ -257,7 +242,7 @@ TEST_CASE("two logs of one file append by turns") {
         putNow(log, line);
         expected += line;
     }
-    CHECK(place.bytes() == expected);
+    CHECK(a.bytes() == expected);
 }
 
 namespace {
@@ -318,10 +303,8 @@ TEST_CASE("lines of several processes are neither lost nor torn when each is flu
 }
 
 TEST_CASE("threads share a log when they guard it with its lock") {
-    Place const place;
-    LogFile log(place.path());
-    log.open(READ_WRITE);
-    checkLinesOf(place, {"x", "y"}, [&](std::string const& writer) {
+    OwnLog log(READ_WRITE);
+    checkLinesOf(log.place, {"x", "y"}, [&](std::string const& writer) {
         for (int i = 0; i < LINES; ++i) {
             log.lock();
             put(log, lineOf(writer, i));
@@ -332,15 +315,13 @@ TEST_CASE("threads share a log when they guard it with its lock") {
 }
 
 TEST_CASE("the library's inserters write to a log") {
-    Place const place;
-    LogFile log(place.path());
-    log.open(WRITE);
+    OwnLog log(WRITE);
     Koru::operator<<(log, L"wide \u00E9"s) << '\n';
     Koru::operator<<(log, std::string(300, 'n')) << '\n'; // counted with 8 bits
     Koru::operator<<(log, File::Path("/dir/name")) << std::endl;
     log << 42 << ' ' << std::hex << 255 << '\n';
     log.close();
-    CHECK(place.bytes() == "wide \xE9\n" + std::string(44, 'n') + "\n/dir/name\n42 ff\n");
+    CHECK(log.bytes() == "wide \xE9\n" + std::string(44, 'n') + "\n/dir/name\n42 ff\n");
 }
 
 TEST_CASE("a log without the write bit prints its whole name on standard output and fails") {
@@ -481,8 +462,7 @@ TEST_CASE("a directory can be opened without the write bit, but not as a log") {
 }
 
 TEST_CASE("opening an open log closes it first and opens it again") {
-    Place const place;
-    LogFile log(place.path());
+    OwnLog log;
     // The last empties nothing, since the file was open.
     for (unsigned int const mode : {WRITE, READ_WRITE, WRITE}) {
         log.open(mode);
@@ -492,7 +472,7 @@ TEST_CASE("opening an open log closes it first and opens it again") {
         put(log, "line\n");
     }
     log.close();
-    CHECK(place.bytes() == "line\nline\nline\n");
+    CHECK(log.bytes() == "line\nline\nline\n");
 }
 
 TEST_CASE("synchronize of an open log writes it out, closes it and fails to open it") {
@@ -508,17 +488,14 @@ TEST_CASE("synchronize of an open log writes it out, closes it and fails to open
 }
 
 TEST_CASE("synchronize of a closed log does nothing") {
-    Place const place;
-    LogFile log(place.path());
+    OwnLog log;
     log.synchronize();
     CHECK(!log.is_open());
-    CHECK(!place.exists());
+    CHECK(!log.place.exists());
 }
 
 TEST_CASE("a log with a mode set is opened as a plain file by synchronize") {
-    Place const place;
-    LogFile log(place.path());
-    log.open(READ_WRITE);
+    OwnLog log(READ_WRITE);
     put(log, "one\n");
     log.setMode(File::READ | File::WRITE);
     log.synchronize();
@@ -526,19 +503,18 @@ TEST_CASE("a log with a mode set is opened as a plain file by synchronize") {
     CHECK(log.getMode() == 3UL);
     put(log, "two"); // not at the end any more
     log.close();
-    CHECK(place.bytes() == "two\n");
+    CHECK(log.bytes() == "two\n");
 }
 
 TEST_CASE("a call through a file opens the log as a plain file") {
-    Place const place;
-    place.write("before\n");
-    LogFile log(place.path());
+    OwnLog log;
+    log.place.write("before\n");
     File& file = log;
     file.open(File::READ | File::WRITE);
     CHECK(file.getMode() == 3UL);
     put(log, "AFTER");
     log.close();
-    CHECK(place.bytes() == "AFTERe\n");
+    CHECK(log.bytes() == "AFTERe\n");
     file.open(File::READ); // without the line and the failure
     CHECK(file.getMode() == 1UL);
     std::string content;
@@ -562,8 +538,7 @@ public:
 } // namespace
 
 TEST_CASE("the opening of a log can be overridden") {
-    Place const place;
-    Recorder recorder(place.path());
+    test::OwnFile<Recorder> recorder;
     LogFile& log = recorder;
     log.open(WRITE);
     CHECK(recorder.calls == 1);
@@ -608,8 +583,7 @@ TEST_CASE("a full device shows in the state of the stream") {
 }
 
 TEST_CASE("opening takes the lock only for a while, and output takes none") {
-    Place const place;
-    LogFile log(place.path());
+    OwnLog log;
     CHECK(log.lock());
     log.open(READ_WRITE); // the holder may
     CHECK(log.unlock());
@@ -621,5 +595,5 @@ TEST_CASE("opening takes the lock only for a while, and output takes none") {
     std::thread([&] { put(log, "line\n"); }).join();
     CHECK(log.unlock());
     log.close();
-    CHECK(place.bytes() == "line\n");
+    CHECK(log.bytes() == "line\n");
 }

@@ -26,6 +26,7 @@
 
 #include <koru/datafile.h>
 
+#include "support/ownfile.h"
 #include "support/shown.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
@@ -146,6 +147,8 @@ inline Loaded load(std::string rest) {
     }
     return result;
 }
+
+using OwnDataFile = OwnFile<Koru::DataFile>;
 
 /// The records held, by position.
 inline Entries held(Koru::DataFile& file) {

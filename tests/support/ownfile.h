@@ -1,0 +1,36 @@
+// A file object with its file.
+#ifndef KORU_TESTS_OWNFILE_H
+#define KORU_TESTS_OWNFILE_H
+
+#include <string>
+
+#include "support/tempdir.h"
+
+namespace test {
+
+/// The base that makes a place before the file object and removes it afterwards.
+struct HasPlace {
+    Place const place;
+};
+
+/// A file object in a place of its own. With a mode it is open, with bytes they are in the file.
+template <class File>
+class OwnFile : public HasPlace, public File {
+public:
+    OwnFile() : File(place.path()) {}
+    template <class Mode>
+    explicit OwnFile(Mode mode) : OwnFile() {
+        this->open(mode);
+    }
+    template <class Mode>
+    OwnFile(std::string const& bytes, Mode mode) : OwnFile() {
+        place.write(bytes);
+        this->open(mode);
+    }
+
+    std::string bytes() const { return place.bytes(); }
+};
+
+} // namespace test
+
+#endif
