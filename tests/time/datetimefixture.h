@@ -126,6 +126,23 @@ struct Fields {
     long offset;
     unsigned int parts;
 
+    /// With 0 in those that the given parts do not have.
+    Fields only(unsigned int given) const {
+        Fields fields = *this;
+        if ((given & DATE) == 0) fields.year = fields.month = fields.day = 0;
+        if ((given & TIME) == 0) {
+            fields.hour = fields.minute = fields.second = fields.offset = 0;
+            fields.millisecond = 0;
+        }
+        return fields;
+    }
+    /// The same, as a value that carries these parts.
+    Fields of(unsigned int given) const {
+        Fields fields = only(given);
+        fields.parts = given & 0xFFU;
+        return fields;
+    }
+
     std::string shown() const {
         char text[200];
         std::snprintf(text, sizeof text, "%ld/%ld/%ld %ld:%ld:%ld.%lu offset %ld parts %u", year,
@@ -164,6 +181,17 @@ inline std::tm brokenDown(int year, int month, int day, int hour = 0, int minute
     time.tm_isdst = -1;
     return time;
 }
+
+/// Whether all is the same that mktime looks at.
+inline bool isSame(std::tm const& a, std::tm const& b) {
+    return a.tm_year == b.tm_year && a.tm_mon == b.tm_mon && a.tm_mday == b.tm_mday &&
+           a.tm_hour == b.tm_hour && a.tm_min == b.tm_min && a.tm_sec == b.tm_sec &&
+           a.tm_isdst == b.tm_isdst;
+}
+
+/// Parts with and without bits that are none.
+unsigned int const ANY_PARTS[] = {0,     DATE,  TIME,       BOTH,       4,         7,
+                                  0x100, 0x101, 0xFFFFFF02, 0xFFFFFFFE, 0xFFFFFFFF};
 
 /// A value of any fields, which are not checked on this way.
 inline DateTime valueOf(int year, int month, int day, int hour = 0, int minute = 0, int second = 0,
