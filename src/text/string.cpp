@@ -102,20 +102,21 @@ int compare(std::wstring const& a, std::wstring const& b) {
     return _compareCases(x + i, y + i, size - i);
 }
 
-std::wstring wideString(wchar_t const* s, std::size_t size) {
+// What is too long for any string is want of memory too: callers have one failure to know.
+std::wstring wideString(wchar_t const* s, std::size_t size) try {
     constexpr std::size_t worthwhile = 128; // Beyond it, to fill the string first takes longer.
     if (size > worthwhile) return std::wstring(s, size);
     std::wstring result(size, L'\0');
     std::copy(s, s + size, result.begin());
     return result;
+} catch (std::length_error const&) {
+    throw std::bad_alloc();
 }
 
 namespace {
 
 std::string _toString(char const* s, std::size_t size) { return std::string(s, size); }
 std::wstring _toString(wchar_t const* s, std::size_t size) { return wideString(s, size); }
-
-// What is too long for any string is want of memory too: callers have one failure to know.
 
 template <class Char>
 std::basic_string<Char> _copy(Char const* s, std::basic_string<Char> const& nothing) try {

@@ -157,3 +157,10 @@ TEST_CASE("wide text too long for a string is want of memory") {
         checkTooLong(L'x', count, [](wchar_t const* s) { Koru::make_string(s); });
     }
 }
+
+TEST_CASE("a range of wide text too long for a string is want of memory") {
+    if (!canBeTooLong()) return;
+    for (std::size_t const count : {TOO_MANY_CHARACTERS, TWO_GIB / sizeof(wchar_t)}) {
+        checkTooLong(L'x', count, [count](wchar_t const* s) { Koru::wideString(s, count); });
+    }
+}
