@@ -26,7 +26,7 @@ using test::inEachLocale;
 
 namespace {
 
-/// From memory that ends where the text ends, so that a sanitizer sees what is read behind it.
+/// From memory that ends where the text ends, so that a sanitizer sees what is read beyond it.
 template <class Char>
 std::uint32_t numberOf(std::basic_string<Char> const& name, std::uint32_t before = 0) {
     std::vector<Char> const exact(name.begin(), name.end());
@@ -154,7 +154,7 @@ TEST_CASE("names that are numbered have numbers as if drawn by lot") {
     }
 }
 
-TEST_CASE("what stands before a name counts") {
+TEST_CASE("what comes before a name counts") {
     std::set<Fingerprint> numbers;
     for (std::uint32_t i = 0; i < 1000; ++i) {
         numbers.insert(Koru::toFingerprint(
