@@ -67,7 +67,7 @@ std::vector<Sample> const samples{
     stored("gatekeeper.conf", 22, 5),   // mostly comments, values that go on below
     stored("harbour.skin", 20, 4),      // indented, with box characters
     stored("hillpost.cnf", 18, 5),      // entries without a section, padded headers, tabs
-    stored("lanternd.service", 27, 3),  // keys that stand several times, long values
+    stored("lanternd.service", 27, 3),  // keys that are there several times, long values
     stored("orchard.ini", 14, 4),       // many comments, blanks around the equals sign
     stored("paperkite.desktop", 48, 3), // many languages
     stored("tidepool.ini", 12, 4),      // carriage returns
@@ -274,7 +274,7 @@ TEST_CASE("samples say what a reader finds in them") {
         {"commons.conf", L"kitchen", L"comment ", L" Pans, and who stirs them"},
         {"harbour.skin", L"Frame", L"across ", L" \u2500"},
         {"harbour.skin", L"names", L"sail ", L" #eee"},
-        // Blanks and tabs belong to names; text behind # belongs to the value.
+        // Blanks and tabs belong to names; text after # belongs to the value.
         {"hillpost.cnf", L" bags_morning ", L"shelf\t\t", L" ./bags\t\t# left of the door"},
         {"hillpost.cnf", L"bags_morning", L"shelf", L""},
         {"hillpost.cnf", L"", L"STAIRS\t\t", L""},
