@@ -144,7 +144,7 @@ public:
         if (entry.section != last_) {
             last_ = entry.section;
             StoredText const& section = table_.sectionOf(entry);
-            matches_ = section.empty() ? name_.empty() || name_[0] == 0 : areEqual(section, name_);
+            matches_ = section.empty() ? name_[0] == 0 : areEqual(section, name_);
         }
         return matches_;
     }

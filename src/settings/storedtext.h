@@ -15,6 +15,7 @@
 #include "text/convert.h"
 #include "text/fingerprint.h"
 #include "text/fold.h"
+#include "text/wellformed.h"
 
 namespace Koru {
 
@@ -86,13 +87,6 @@ int compare(StoredText const& a, StoredText const& b);
 
 /// Whether `compare` finds them equal.
 bool areEqual(StoredText const& a, std::wstring const& b);
-
-/// Whether the bytes are ASCII without a NUL.
-bool isPlain(std::string_view bytes);
-
-/// Whether make_string gives these bytes for what make_wstring makes of them. May be false for
-/// characters beyond four bytes, of which no text consists.
-bool isCanonical(std::string_view bytes);
 
 /// Mixes the text into the number of the text before it, see text/fingerprint.h.
 inline std::uint32_t mixFingerprint(std::uint32_t before, std::wstring const& text) {

@@ -23,6 +23,9 @@ std::size_t encodedBound(wchar_t const* s, std::size_t size);
 /// end of what was written.
 char* encode(wchar_t const* s, std::size_t size, char* to);
 
+/// Whether a byte continues a character that began before it.
+inline bool isContinuation(char c) { return (c & 0xC0) == 0x80; }
+
 /// The value of one character of UTF-8, and how many bytes it took.
 struct Decoded {
     wchar_t value;
@@ -37,7 +40,7 @@ inline Decoded decodeOne(char const* text, std::size_t size) {
     auto const tail = [&byte](std::size_t i) { return byte(i) & 0x3F; };
     std::int32_t const b = byte(0);
     if (b < 0x80) return {b, 1};
-    // A sequence that the end cuts short is no longer form's case either: `?`, one byte at a time.
+    // A sequence cut short by the end is not tried as a longer form: its lead becomes `?`.
     if ((b & 0xE0) == 0xC0) {
         if (size >= 2) return {(b & 0x1F) << 6 | tail(1), 2};
     } else if ((b & 0xF0) == 0xE0) {

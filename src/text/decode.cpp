@@ -208,8 +208,8 @@ std::size_t countLeads(char const* s, std::size_t size) {
         __m128i const leads = _mm_cmpgt_epi8(load16(s), _mm_set1_epi8(-0x41));
         counts = _mm_add_epi32(counts, _mm_sad_epu8(_mm_sub_epi8(zero, leads), zero));
     }
-    auto const begins = [](char c) { return static_cast<signed char>(c) >= -0x40; };
-    return sum4(counts) + static_cast<std::size_t>(std::count_if(s, end, begins));
+    auto const isLead = [](char c) { return !isContinuation(c); };
+    return sum4(counts) + static_cast<std::size_t>(std::count_if(s, end, isLead));
 }
 
 } // namespace Koru

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <array>
 
+#include "text/convert.h"
 #include "text/narrow.h"
 
 namespace Koru {
@@ -79,8 +80,8 @@ constexpr std::size_t MOST = 256;
 /// `classOf` for sixteen characters of ASCII.
 __m128i _classesOf(__m128i characters) {
     __m128i const lower = _mm_or_si128(characters, _mm_set1_epi8(0x20));
-    __m128i const isK = _mm_cmpeq_epi8(lower, _mm_set1_epi8('k'));
-    return _mm_xor_si128(lower, _mm_and_si128(isK, _mm_set1_epi8('k' ^ 'i')));
+    __m128i const isK = _mm_cmpeq_epi8(lower, _mm_set1_epi8(SMALL_K));
+    return _mm_xor_si128(lower, _mm_and_si128(isK, _mm_set1_epi8(SMALL_K ^ SMALL_I)));
 }
 
 /// The highest bit of each byte tells whether `narrow16` met something else than a character of
@@ -144,7 +145,7 @@ private:
     __m128i sum_ = _mm_setzero_si128();
 };
 
-bool _continues(char c) { return (c & 0xC0) == 0x80; }
+bool _continues(char c) { return isContinuation(c); }
 bool _continues(wchar_t) { return false; }
 
 /// The number of a name that is not all ASCII or holds a NUL. Apart, so that others do without the

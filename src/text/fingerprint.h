@@ -6,6 +6,8 @@
 #include <cstdint>
 #include <vector>
 
+#include "text/fold.h"
+
 namespace Koru {
 
 /// A name's number. Equal for any two names that `compare` finds equal, under whatever locale.
@@ -22,12 +24,11 @@ std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint 
                             Fingerprint orThis, std::size_t from);
 
 /// What a character other than NUL counts as. Two that some locale pairs count as the same: the
-/// letters of ASCII as their lower case, but for those that are paired with characters beyond ASCII
-/// (I and i with the Turkish dotted and dotless i, K with the Kelvin sign), which count as one with
-/// all of these. That some other characters of ASCII count as the same, too, only costs
-/// comparisons.
+/// letters of ASCII as their lower case, but those that are paired with characters beyond ASCII
+/// (see DisputedLetter) as one with all of these. That some other characters of ASCII count as the
+/// same, too, only costs comparisons.
 constexpr std::uint32_t classOf(std::uint32_t c) {
-    return c >= 0x80 || (c | 0x20) == 'k' ? 'i' : c | 0x20;
+    return c >= 0x80 || (c | 0x20) == SMALL_K ? std::uint32_t{SMALL_I} : c | 0x20;
 }
 
 /// Mixes a name into the number of the name before it. Bytes are well-formed UTF-8 without a NUL;

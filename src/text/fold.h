@@ -2,22 +2,33 @@
 #ifndef KORU_TEXT_FOLD_H
 #define KORU_TEXT_FOLD_H
 
+#include <cstdint>
 #include <cwchar>
 #include <cwctype>
 
 namespace Koru {
 
-/// The character as towlower gives it under the current C locale. No locale disputes how ASCII is
-/// lowered but for I, the capital of dotless i in Turkish, so only that and what is beyond ASCII
-/// has to be asked.
+/// The letters of ASCII that locales dispute. All others are paired, A with a to Z with z and with
+/// nothing else, in every locale.
+enum DisputedLetter : std::uint8_t {
+    CAPITAL_I = 'I', ///< in Turkish and Azerbaijani the capital of dotless i, U+0131
+    SMALL_I = 'i',   ///< also the lower case of dotted I, U+0130
+    SMALL_K = 'k',   ///< also the lower case of the Kelvin sign, U+212A
+};
+
+/// Whether every locale lowers a character as ASCII has it. It does not matter here what else is
+/// lowered to the same.
+inline bool isUndisputed(wchar_t c) { return static_cast<wint_t>(c) < 0x80 && c != CAPITAL_I; }
+
+/// The character as towlower gives it under the current C locale, which is asked where it matters.
 inline wint_t lower(wchar_t c) {
     auto const value = static_cast<wint_t>(c);
-    if (value >= 0x80 || c == L'I') return std::towlower(value);
+    if (!isUndisputed(c)) return std::towlower(value);
     return c >= L'A' && c <= L'Z' ? value + (L'a' - L'A') : value;
 }
 
-/// Whether every locale lowers a character as ASCII has it.
-inline bool isUndisputed(wchar_t c) { return static_cast<wint_t>(c) < 0x80 && c != L'I'; }
+/// Whether I and i are a pair under the current C locale.
+inline bool isPairOfI() { return lower(CAPITAL_I) == SMALL_I; }
 
 /// Compares two texts as wcscasecmp (POSIX) does. A cursor's `next` gives one character after the
 /// other and then 0. Inlined by force: a call costs as much as a few characters.

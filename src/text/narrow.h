@@ -2,8 +2,11 @@
 #ifndef KORU_TEXT_NARROW_H
 #define KORU_TEXT_NARROW_H
 
+#include <algorithm>
 #include <cstddef>
+#include <cstdint>
 #include <cstring>
+#include <string_view>
 #include <type_traits>
 
 #include "text/simd.h"
@@ -66,6 +69,39 @@ bool isAscii(Char const* s, std::size_t size) {
         if (!areAscii(narrow16(s + i))) return false;
     }
     return areAscii(narrow16(s + size - 16)); // overlaps what was looked at already
+}
+
+/// Whether two texts of the same size are the same and ASCII.
+inline bool areSameAscii(char const* a, wchar_t const* b, std::size_t size) {
+    auto const same = [](__m128i x, __m128i y) {
+        return areAscii(x) && holdsEverywhere(_mm_cmpeq_epi8(x, y));
+    };
+    if (size == 0) return true;
+    if (size <= 16) return same(narrowAll(a, size), narrowAll(b, size));
+    for (std::size_t i = 0; i < size - 16; i += 16) {
+        if (!same(narrow16(a + i), narrow16(b + i))) return false;
+    }
+    return same(narrow16(a + size - 16), narrow16(b + size - 16));
+}
+
+/// The first byte at which two texts differ, or the size of the shorter one.
+inline std::size_t firstDifference(std::string_view a, std::string_view b) {
+    std::size_t const size = std::min(a.size(), b.size());
+    std::size_t i = 0;
+    for (; size - i >= 16; i += 16) {
+        std::uint32_t const same =
+            highBits(_mm_cmpeq_epi8(load16(a.data() + i), load16(b.data() + i)));
+        if (same != ALL_BYTES) return i + static_cast<std::size_t>(__builtin_ctz(~same));
+    }
+    for (; size - i >= 4; i += 4) {
+        std::uint32_t x;
+        std::uint32_t y;
+        std::memcpy(&x, a.data() + i, sizeof x);
+        std::memcpy(&y, b.data() + i, sizeof y);
+        if (x != y) return i + static_cast<std::size_t>(__builtin_ctz(x ^ y)) / 8;
+    }
+    while (i != size && a[i] == b[i]) ++i;
+    return i;
 }
 
 /// Writes the low 8 bits of each character, which are all of it in such a text, and returns the end

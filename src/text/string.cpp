@@ -60,7 +60,7 @@ struct FourPairs {
         __m128i const ignored = _mm_and_si128(_mm_cmpeq_epi32(behindZ, zero), caseBit);
         __m128i const isEqual = _mm_cmpeq_epi32(_mm_andnot_si128(ignored, difference), zero);
         same = _mm_andnot_si128(_mm_cmpeq_epi32(a, zero), isEqual);
-        disputed = _mm_and_si128(_mm_cmpeq_epi32(lowered, _mm_set1_epi32('i')), difference);
+        disputed = _mm_and_si128(_mm_cmpeq_epi32(lowered, _mm_set1_epi32(SMALL_I)), difference);
     }
 
     __m128i same;     ///< all bits where equal but for the case of an ASCII letter, and not NUL
@@ -79,7 +79,7 @@ struct FourPairs {
         disputed = _mm_or_si128(disputed, pairs.disputed);
     }
     bool const agreed = highBits(_mm_cmpeq_epi32(disputed, zero)) == ALL_BYTES;
-    if (!agreed && lower(L'I') != L'i') i = 0;
+    if (!agreed && !isPairOfI()) i = 0;
     return compareFolded(WideCursor(a + i), WideCursor(b + i));
 }
 
