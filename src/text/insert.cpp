@@ -1,8 +1,8 @@
 #include "text/insert.h"
 
-#include <cxxabi.h>
-
 #include <ostream>
+
+#include "concurrency/cancellation.h"
 
 namespace Koru {
 
@@ -25,22 +25,19 @@ void _setBad(std::ostream& os) {
 
 /// Hands the characters up to `last` and that one to the buffer, at once but with the outcome of
 /// one by one: the first that fails makes the stream bad, and the next after that makes it fail.
-/// The unwinding of a cancelled thread carries no object, which the sanitizer takes for a null
-/// reference.
-__attribute__((no_sanitize("undefined"))) void _passThrough(std::ostream& os, char const* s,
-                                                            char const* last) {
-    bool onlyLast = false;
-    try {
+void _passThrough(std::ostream& os, char const* s, char const* last) {
+    bool onlyLast = false; // is left to be put
+    auto const put = [&] {
         onlyLast = os.rdbuf()->sputn(s, last - s) == last - s;
         if (onlyLast && os.rdbuf()->sputc(*last) != std::char_traits<char>::eof()) return;
         os.setstate(std::ios::badbit);
-    } catch (abi::__forced_unwind const&) {
-        _setBad(os);
-        throw;
-    } catch (...) {
+    };
+    auto const setBad = [&os] { _setBad(os); };
+    auto const catchUnlessAsked = [&os] {
         _setBad(os);
         if ((os.exceptions() & std::ios::badbit) != 0) throw;
-    }
+    };
+    undoIfCancelled([&] { attempt(put, catchUnlessAsked); }, setBad);
     if (!onlyLast) os.setstate(std::ios::failbit);
 }
 
