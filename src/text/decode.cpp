@@ -61,9 +61,13 @@ Decoding _decodeAscii(Decoding at, char const* end, wchar_t const* full) {
     return at;
 }
 
-// Sequences of two and three bytes. Every byte of a step is decoded as though a character began
-// there; then those where none begins are squeezed out. That takes no branch on the text and no
-// look at one character before the next can be found.
+// Characters of one to three bytes:
+//   0xxxxxxx
+//   110xxxxx 10xxxxxx
+//   1110xxxx 10xxxxxx 10xxxxxx
+// Every byte of a step is decoded as though a character began there. Then the values of
+// continuation bytes are dropped by compressing the others. So nothing branches on the text, and no
+// character has to be decoded before the next one is found.
 
 /// Writes those of eight 16-bit values that the lowest bits of `keep` tell, and returns the end of
 /// what was written.
@@ -78,8 +82,8 @@ __attribute__((target("ssse3"))) wchar_t* _compress8(__m128i values, std::uint32
     return to + COMPRESSION.kept[keep];
 }
 
-/// What the sixteen bytes mean where a character begins: its value is top << 12 | middle << 6 |
-/// low.
+/// The bits of the characters that begin at each of sixteen bytes. The value of a character is
+/// top << 12 | middle << 6 | low.
 struct Bits {
     __m128i top;
     __m128i middle;
@@ -102,7 +106,7 @@ Bits _bits(char const* s, __m128i bytes) {
             either(three, third, either(several, second, bytes))};
 }
 
-/// Puts the bits of eight characters together; the lead's high bits fall out at the top.
+/// Joins the bits of eight characters. The marks of their lead bytes are shifted out at the top.
 __attribute__((target("ssse3"))) __m128i _join(__m128i low, __m128i middle, __m128i top) {
     __m128i const weights = _mm_set1_epi16(64 << 8 | 1);
     __m128i const zero = _mm_setzero_si128();
@@ -110,8 +114,8 @@ __attribute__((target("ssse3"))) __m128i _join(__m128i low, __m128i middle, __m1
                         _mm_slli_epi16(_mm_unpacklo_epi8(zero, top), 4));
 }
 
-/// Decodes a step in which characters of up to three bytes begin where `leads` tells and returns
-/// the end of what was written; null if one of them is zero.
+/// Decodes a step in which characters of up to three bytes begin where the bits of `leads` are set.
+/// Returns the end of what was written, or null if one of the characters is zero.
 __attribute__((target("ssse3"))) wchar_t* _decodeThrees(char const* s, __m128i bytes,
                                                         std::uint32_t leads, wchar_t* to) {
     __m128i const zero = _mm_setzero_si128();
@@ -120,15 +124,16 @@ __attribute__((target("ssse3"))) wchar_t* _decodeThrees(char const* s, __m128i b
     __m128i const last =
         _join(_mm_unpackhi_epi64(bits.low, zero), _mm_unpackhi_epi64(bits.middle, zero),
               _mm_unpackhi_epi64(bits.top, zero));
-    // What stands where no character begins is not zero either: it is a continuation byte.
+    // A continuation byte, decoded as though it were a lead, is not zero either.
     __m128i const zeros = _mm_or_si128(_mm_cmpeq_epi16(first, zero), _mm_cmpeq_epi16(last, zero));
     if (highBits(zeros) != 0) return nullptr;
     to = _compress8(first, leads, to);
     return _compress8(last, leads >> 8, to);
 }
 
-/// Decodes a step of four characters of four bytes and returns the end of what was written; null if
-/// one of them is zero.
+/// Decodes a step of four characters of four bytes:
+///   11110xxx 10xxxxxx 10xxxxxx 10xxxxxx
+/// Returns the end of what was written, or null if one of the characters is zero.
 __attribute__((target("ssse3"))) wchar_t* _decodeFours(__m128i bytes, wchar_t* to) {
     __m128i const bits = _mm_and_si128(bytes, _mm_set1_epi32(0x3F3F3F07));
     __m128i const twelves = _mm_maddubs_epi16(bits, _mm_set1_epi16(1 << 8 | 64));
@@ -138,29 +143,30 @@ __attribute__((target("ssse3"))) wchar_t* _decodeFours(__m128i bytes, wchar_t* t
     return to + 4;
 }
 
-/// Which bytes of a step are what; bit i stands for byte i.
+/// Which bytes of a step are lead bytes and which are continuation bytes: bit i is for byte i.
 struct Shape {
     explicit Shape(__m128i bytes)
-        : tails(highBits(_mm_cmplt_epi8(bytes, _mm_set1_epi8(-0x40)))),
-          leads(highBits(bytes) & ~tails), leadsOfThree(leads & highBits(_mm_slli_epi16(bytes, 2))),
+        : continuations(highBits(_mm_cmplt_epi8(bytes, _mm_set1_epi8(-0x40)))),
+          leads(highBits(bytes) & ~continuations),
+          leadsOfThree(leads & highBits(_mm_slli_epi16(bytes, 2))),
           leadsOfFour(leadsOfThree & highBits(_mm_slli_epi16(bytes, 3))),
           leadsOfMore(leadsOfFour & highBits(_mm_slli_epi16(bytes, 4))) {}
 
-    /// The continuation bytes that the leads ask for, within the step and beyond.
+    /// The continuation bytes that the lead bytes ask for, within the step and beyond.
     std::uint32_t asked() const { return leads << 1 | leadsOfThree << 2 | leadsOfFour << 3; }
 
-    std::uint32_t tails;        ///< continuation bytes
-    std::uint32_t leads;        ///< of sequences of two bytes and more
-    std::uint32_t leadsOfThree; ///< and more
-    std::uint32_t leadsOfFour;  ///< and more
-    std::uint32_t leadsOfMore;  ///< of five and six, and the two bytes that are none
+    std::uint32_t continuations; ///< continuation bytes
+    std::uint32_t leads;         ///< of sequences of two bytes and more
+    std::uint32_t leadsOfThree;  ///< and more
+    std::uint32_t leadsOfFour;   ///< and more
+    std::uint32_t leadsOfMore;   ///< of five and six, and the two bytes that are none
 };
 
 /// Decodes whole steps of well-formed text while there is room for another.
 __attribute__((target("ssse3"))) Decoding _decodeMixed(Decoding at, char const* end,
                                                        wchar_t const* full) {
     constexpr std::uint32_t fours = 0x1111; // the leads of a step of nothing but fours
-    // The continuation bytes that the last characters still own: bit i for byte i from here.
+    // The continuation bytes that characters of the last step still lack: bit i is for byte i.
     std::uint32_t owed = 0;
     for (; end - at.s >= STEP + 2 && full - at.to >= STEP; at.s += STEP) {
         __m128i const bytes = load16(at.s);
@@ -171,10 +177,10 @@ __attribute__((target("ssse3"))) Decoding _decodeMixed(Decoding at, char const* 
         }
         Shape const shape(bytes);
         std::uint32_t const asked = owed | shape.asked();
-        if ((asked & ALL_BYTES) != shape.tails || shape.leadsOfMore != 0) break;
+        if ((asked & ALL_BYTES) != shape.continuations || shape.leadsOfMore != 0) break;
         wchar_t* to = nullptr;
         if (shape.leadsOfFour == 0) {
-            to = _decodeThrees(at.s, bytes, ~shape.tails, at.to);
+            to = _decodeThrees(at.s, bytes, ~shape.continuations, at.to);
         } else if (shape.leadsOfFour == fours) {
             to = _decodeFours(bytes, at.to);
         }

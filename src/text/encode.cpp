@@ -11,7 +11,7 @@ namespace Koru {
 
 namespace {
 
-/// The bytes of the longest form.
+/// The bytes of the longest encoding of a character.
 constexpr std::ptrdiff_t LONGEST = 6;
 
 /// Writes one character and returns the end of what was written.
@@ -70,8 +70,13 @@ Encoding _encodeAscii(Encoding at, wchar_t const* end, char const* last) {
     return at;
 }
 
-// Forms of up to four bytes. Each character is spread over as many bytes as the longest form has,
-// with zeros for those that its own form has not; then the zeros are dropped.
+// Encodings of one to four bytes:
+//   0xxxxxxx
+//   110xxxxx 10xxxxxx
+//   1110xxxx 10xxxxxx 10xxxxxx
+//   11110xxx 10xxxxxx 10xxxxxx 10xxxxxx
+// Each character is spread over as many bytes as the longest of them has; a shorter one begins with
+// zeros. Compressing drops the zeros.
 
 /// Writes those of the lower eight bytes that the lowest bits of `keep` tell, and returns the end
 /// of what was written.
@@ -101,13 +106,13 @@ inline __m128i _splitTwentyFour(__m128i c) {
     return _splitTwelve(_mm_or_si128(_mm_srli_epi32(c, 12), _mm_slli_epi32(c, 16)));
 }
 
-/// The forms of eight 16-bit characters below 0x800, in two bytes each.
+/// The encodings of eight 16-bit characters below 0x800, in two bytes each.
 inline __m128i _formsOfTwo(__m128i c) {
     __m128i const two = _mm_or_si128(_splitTwelve(c), _mm_set1_epi16(static_cast<short>(0x80C0)));
     return either(_mm_cmpgt_epi16(c, _mm_set1_epi16(0x7F)), two, _mm_slli_epi16(c, 8));
 }
 
-/// Writes the forms of eight 16-bit characters from 1 to 0x7FF.
+/// Encodes eight 16-bit characters from 1 to 0x7FF.
 __attribute__((target("ssse3"))) inline char* _encodeTwos(__m128i c, char* to) {
     if (highBits(_mm_cmpgt_epi16(c, _mm_set1_epi16(0x7F))) != 0)
         return _dropZeros(_formsOfTwo(c), to);
@@ -115,13 +120,13 @@ __attribute__((target("ssse3"))) inline char* _encodeTwos(__m128i c, char* to) {
     return to + STEP / 2;
 }
 
-/// The forms of four characters below 0x200000, in four bytes each.
+/// The encodings of four characters below 0x200000, in four bytes each.
 inline __m128i _formsOfFour(__m128i c) {
     auto const above = [c](int limit, std::uint32_t marks) {
         return _mm_and_si128(_mm_cmpgt_epi32(c, _mm_set1_epi32(limit)),
                              _mm_set1_epi32(static_cast<int>(marks)));
     };
-    // The marks of a form take the place of those of the next shorter one.
+    // The marks of lead and continuation bytes replace those of the next shorter encoding.
     __m128i const marks = _mm_xor_si128(
         _mm_xor_si128(above(0x7F, 0x80C00000U), above(0x7FF, 0x80C00000U ^ 0x8080E000U)),
         above(0xFFFF, 0x8080E000U ^ 0x808080F0U));
@@ -129,7 +134,7 @@ inline __m128i _formsOfFour(__m128i c) {
                   _mm_or_si128(_splitTwentyFour(c), marks), _mm_slli_epi32(c, 24));
 }
 
-/// Writes the forms of four characters of three bytes each, and four bytes beyond.
+/// Encodes four characters of three bytes each. Writes four bytes beyond them, too.
 __attribute__((target("ssse3"))) inline char* _encodeThrees(__m128i c, char* to) {
     __m128i const forms =
         _mm_or_si128(_splitTwentyFour(c), _mm_set1_epi32(static_cast<int>(0x8080E000U)));
@@ -138,8 +143,8 @@ __attribute__((target("ssse3"))) inline char* _encodeThrees(__m128i c, char* to)
     return to + 12;
 }
 
-/// Encodes half a step of characters from 1 to 0x1FFFFF and returns the end of what was written;
-/// null if there are others.
+/// Encodes half a step of characters from 1 to 0x1FFFFF. Returns the end of what was written, or
+/// null if there are other characters.
 __attribute__((target("ssse3"))) inline char* _encodeHalfStep(__m128i a, __m128i b, char* to) {
     __m128i const zero = _mm_setzero_si128();
     __m128i const all = _mm_packs_epi32(a, b);
@@ -217,7 +222,7 @@ bool _holdsNul(wchar_t const* s) {
 
 } // namespace
 
-// Not only called beside a block.
+// Unlike the conversions, it is also called from frames without a block, which may be misaligned.
 [[gnu::force_align_arg_pointer]] std::size_t encodedBound(wchar_t const* s, std::size_t size) {
     wchar_t const* const start = s;
     wchar_t const* const end = s + size;

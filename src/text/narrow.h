@@ -68,7 +68,7 @@ bool isAscii(Char const* s, std::size_t size) {
     for (std::size_t i = 0; i < size - 16; i += 16) {
         if (!areAscii(narrow16(s + i))) return false;
     }
-    return areAscii(narrow16(s + size - 16)); // overlaps what was looked at already
+    return areAscii(narrow16(s + size - 16)); // Some of these were tested before.
 }
 
 /// Whether two texts of the same size are the same and ASCII.

@@ -12,9 +12,9 @@ namespace Koru {
 /// The units that a block has room for.
 constexpr std::size_t BLOCK = 2048;
 
-/// How a block on the stack is aligned, and with it the frame of who calls what is below: that
-/// keeps vectors on the stack and does not align it on 32 bits, where callers of the library may
-/// not have.
+/// How a block on the stack is aligned, and with it the frame of the function that has it. The
+/// functions below need that: they keep vectors on the stack without aligning it, and on 32 bits
+/// an application may call the library with a stack that is aligned to four bytes only.
 constexpr std::size_t BLOCK_ALIGNMENT = 16;
 
 /// How many bytes or characters a step takes in at the most.
