@@ -244,7 +244,7 @@ TEST_CASE(
     std::string bytes;
     std::size_t lines = 0;
     test::forEachText(SYNTAX, 5, [&](std::string const& line) {
-        // An entry behind each tells where it belongs.
+        // An entry after each tells where it belongs.
         bytes += line + "\nk" + std::to_string(lines++) + "=v\n";
         if (lines % 128 != 0) return;
         checkFile(bytes);

@@ -45,7 +45,7 @@ SETTINGS_TEST_CASE("the published line length is the largest of a 32-bit unsigne
 }
 
 FAMILIES_TEST_CASE(
-    "the virtual operations keep their order behind the two entries of the destructor") {
+    "the virtual operations keep their order after the two entries of the destructor") {
     using File = typename Family::File;
     CHECK(slotOfOpen<File>() == 2);
     CHECK(slotOf(&File::close) == 3);
@@ -148,7 +148,7 @@ FAMILIES_TEST_CASE("changes without the write bit vanish at close and the file s
     CHECK(std::filesystem::last_write_time(file.place.path()) == time);
 }
 
-FAMILIES_TEST_CASE("a file open for writing is written anew at close, changed or not") {
+FAMILIES_TEST_CASE("a file open for writing is rewritten at close, changed or not") {
     OwnFile<Family> file(Family::untidyBytes());
     for (int i = 0; i < 2; ++i) {
         file.open(READ_WRITE);

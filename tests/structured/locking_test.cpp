@@ -11,6 +11,7 @@
 #include <fstream>
 #include <string>
 #include <thread>
+#include <type_traits>
 #include <vector>
 
 #include "structured/fixture.h"
@@ -242,6 +243,14 @@ FAMILIES_TEST_CASE("edits of several threads are not lost while others synchroni
     CHECK(file.has(3 * count, "value of 179"));
     for (int i = 0; i < 3 * count; ++i) {
         CHECK((Family::value(file, i) == L"value of " + std::to_wstring(i)));
+    }
+    // Settings are in the order in which each thread made them.
+    if (std::is_same<Family, Records>::value) return;
+    std::wstring last[3];
+    for (std::wstring const& key : Family::keys(file)) {
+        std::wstring& before = last[std::stoi(key.substr(4)) / count];
+        CHECK((before < key));
+        before = key;
     }
 }
 

@@ -1,4 +1,4 @@
-// The three structured files behind one face, for what they have in common: opened, loaded, changed
+// The three structured files with one face, for what they have in common: opened, loaded, changed
 // and written back whole. Entries are numbers here: entry n has the key "key n".
 #ifndef KORU_TESTS_STRUCTUREDFILE_H
 #define KORU_TESTS_STRUCTUREDFILE_H
