@@ -38,7 +38,7 @@ std::string complaint(Callable callable) {
 
 /// The place of a file object, made before it and removed after it.
 struct HasPlace {
-    Place const place;
+    Place const place{};
 };
 
 /// A structured file in a place of its own. With bytes it is there, with a mode it is open, too.

@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <exception>
 #include <fstream>
+#include <memory>
 #include <string>
 #include <thread>
 #include <type_traits>
@@ -217,6 +218,39 @@ FAMILIES_TEST_CASE("the lock is held across the whole write-back of close and sy
                   return (late ? "late, " : "early, ") + std::to_string(count);
               }) == (synchronize ? "late, 1" : "late, 0"));
     }
+}
+
+namespace {
+
+/// A structured file that sees, when it is opened, whether another thread has to wait for the lock.
+template <class File>
+class Watcher : public File {
+public:
+    explicit Watcher(std::string const& path) : File(Koru::File::Path(path)) {}
+    void open(unsigned long mode) override {
+        other_ = std::make_unique<OtherThread>([this] { this->lock() && this->unlock(); });
+        isHeld_ = other_->waits();
+        File::open(mode);
+    }
+    bool wasHeld() {
+        other_->join();
+        return isHeld_;
+    }
+
+private:
+    std::unique_ptr<OtherThread> other_;
+    bool isHeld_ = false;
+};
+
+} // namespace
+
+FAMILIES_TEST_CASE("the lock is held between the close and the open of synchronize") {
+    Place const place;
+    using File = typename Family::File;
+    Watcher<File> file(place.path());
+    file.File::open(READ_WRITE);
+    file.synchronize();
+    CHECK(file.wasHeld());
 }
 
 FAMILIES_TEST_CASE("edits of several threads are not lost while others synchronize") {
