@@ -380,13 +380,14 @@ TEST_CASE("sections of units that no UTF-8 gives are found again") {
     }
 }
 
-TEST_CASE("close sorts the table before it touches the file") {
+TEST_CASE("close sorts the table before it touches the file, and look-ups find what it holds") {
     SettingsFile file("", WRITE);
-    file.setValue(L"s", L"b", L"1");
-    file.setValue(L"s", L"a", L"2");
+    for (wchar_t const* const key : {L"f", L"e", L"d", L"c", L"b", L"a"}) {
+        file.setValue(L"s", key, key);
+    }
     std::filesystem::remove_all(file.place.directory().path());
     CHECK(messageOf<std::runtime_error>([&] { file.close(); }) == "failed to open file.");
-    checkEntries(file, "s/a=2 | s/b=1");
+    checkEntries(file, "s/a=a | s/b=b | s/c=c | s/d=d | s/e=e | s/f=f");
 }
 
 TEST_CASE("a read that fails leaves what was read so far, in the order of the file") {
