@@ -10,7 +10,7 @@ namespace test {
 
 /// The base that makes a place before the file object and removes it afterwards.
 struct HasPlace {
-    Place const place;
+    Place const place{};
 };
 
 /// A file object in a place of its own. With a mode it is open, with bytes they are in the file.
