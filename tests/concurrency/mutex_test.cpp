@@ -5,11 +5,13 @@
 
 #include <limits.h>
 #include <pthread.h>
+#include <time.h>
 #include <unistd.h>
 
 #include <atomic>
 #include <chrono>
 #include <cstring>
+#include <functional>
 #include <memory>
 #include <stdexcept>
 #include <string>
@@ -32,6 +34,19 @@ extern "C" char const* __tsan_default_options() {
     return "report_mutex_bugs=0 report_destroy_locked=0";
 }
 #endif
+
+namespace {
+
+thread_local std::function<void(useconds_t)> inSleep; ///< called before the thread sleeps
+
+} // namespace
+
+// The library polls with usleep, and finds this one before the C library's.
+extern "C" int usleep(useconds_t microseconds) {
+    if (inSleep) inSleep(microseconds);
+    timespec const time{0, static_cast<long>(microseconds) * 1000};
+    return ::nanosleep(&time, nullptr);
+}
 
 namespace {
 
@@ -195,6 +210,24 @@ TEST_CASE("a lock that gives up took a millisecond for every try, the last one i
         Clock::time_point const start = Clock::now();
         CHECK(tried(mutex, tries) == GIVES_UP);
         CHECK((Clock::now() - start >= std::chrono::milliseconds(tries)));
+    }
+}
+
+TEST_CASE("a lock gives up after its last sleep, even where the mutex is free by then") {
+    for (unsigned long const tries : {1UL, 3UL}) {
+        CAPTURE(tries);
+        Mutex mutex;
+        Holder holder(mutex);
+        std::vector<useconds_t> sleeps;
+        inSleep = [&](useconds_t microseconds) {
+            sleeps.push_back(microseconds);
+            if (sleeps.size() == tries) holder.letGo();
+        };
+        std::string const result = tried(mutex, tries);
+        inSleep = nullptr;
+        CHECK(result == GIVES_UP);
+        CHECK(sleeps == std::vector<useconds_t>(tries, 1000));
+        follow(mutex, "free");
     }
 }
 
