@@ -203,6 +203,7 @@ TEST_CASE_TEMPLATE("close that cannot create the new file through a stream write
             {
                 auto const file = stored.changed();
                 FailingCall const fault(Call::OPEN, error, before);
+                FailingCall const interruption(Call::WRITE, EINTR); // is no end of the content
                 CHECK(complaint([&] { file->close(); }) == NOT_OPENED);
             }
             CHECK(stored.isNew());
