@@ -42,8 +42,6 @@ namespace {
 using Texts = std::vector<std::wstring>;
 unsigned int const READ_WRITE = 3;
 
-std::atomic<int> errorOfClosing{0};
-
 /// A file's place in a directory of its own.
 struct Place {
     Place() = default;
@@ -65,15 +63,6 @@ struct OpenLog : LogFile {
 };
 
 } // namespace
-
-// The last of the system's answers about a file: what a quota or a server refuses is told by
-// close(2), after all has been written.
-extern "C" int fclose(FILE* stream) {
-    int const result = test::realFunction<int (*)(FILE*)>("fclose")(stream);
-    if (errorOfClosing == 0) return result;
-    errno = errorOfClosing;
-    return EOF;
-}
 
 TEST_CASE("parentheses around a path of a variable declare a function, braces make a file") {
     test::TempDir const directory;
@@ -234,9 +223,10 @@ TEST_CASE_TEMPLATE("what only closing finds is in the fail state, and the table 
     Place const place("[s]\nk=1\n");
     Family file(place.path);
     file.open(READ_WRITE);
-    errorOfClosing = EDQUOT;
-    CHECK(messageOf<std::runtime_error>([&] { file.close(); }) == "<nothing>");
-    errorOfClosing = 0;
+    {
+        FailingCall const fault(Call::CLOSE, EDQUOT, 0, FailingCall::FOR_EVER);
+        CHECK(messageOf<std::runtime_error>([&] { file.close(); }) == "<nothing>");
+    }
     CHECK(file.fail());
     CHECK(!file.is_open());
     CHECK(file.getMode() == 0);

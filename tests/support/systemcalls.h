@@ -6,6 +6,7 @@
 
 #include <dlfcn.h>
 #include <pthread.h>
+#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/uio.h>
 #include <unistd.h>
@@ -19,7 +20,25 @@
 
 namespace test {
 
-enum class Call { OPEN, READ, WRITE, SEEK };
+/// Kinds of calls. OPEN and CLOSE are those of streams and of descriptors.
+enum class Call {
+    OPEN,
+    READ,
+    WRITE,
+    SEEK,
+    STATUS,
+    CLOSE,
+    REMOVE,
+    RENAME,
+    CHMOD,
+    ACCESS,
+    RESOLVE,
+    TRUNCATE
+};
+
+constexpr std::array<Call, 12> CALLS = {Call::OPEN,   Call::READ,   Call::WRITE,   Call::SEEK,
+                                        Call::STATUS, Call::CLOSE,  Call::REMOVE,  Call::RENAME,
+                                        Call::CHMOD,  Call::ACCESS, Call::RESOLVE, Call::TRUNCATE};
 
 /// What the calls of one kind do besides their work.
 struct CallPlan {
@@ -29,7 +48,7 @@ struct CallPlan {
     std::atomic<long> made{0};
 };
 
-inline std::array<CallPlan, 4> callPlans;
+inline std::array<CallPlan, CALLS.size()> callPlans;
 
 inline CallPlan& planOf(Call call) { return callPlans[static_cast<std::size_t>(call)]; }
 
@@ -188,6 +207,55 @@ extern "C" int ioctl(int fd, unsigned long request, ...) noexcept {
         return 0;
     }
     return static_cast<int>(::syscall(SYS_ioctl, fd, request, argument));
+}
+
+// What fails to be closed is closed all the same, as the system does it.
+extern "C" int fclose(FILE* stream) {
+    int const result = test::realFunction<int (*)(FILE*)>("fclose")(stream);
+    return test::failsNow(test::Call::CLOSE) ? EOF : result;
+}
+
+extern "C" int close(int fd) {
+    int const result = test::realFunction<int (*)(int)>("close")(fd);
+    return test::failsNow(test::Call::CLOSE) ? -1 : result;
+}
+
+extern "C" int fstat64(int fd, struct stat64* status) noexcept {
+    if (test::failsNow(test::Call::STATUS)) return -1;
+    return test::realFunction<int (*)(int, struct stat64*)>("fstat64")(fd, status);
+}
+
+extern "C" int remove(char const* name) noexcept {
+    if (test::failsNow(test::Call::REMOVE)) return -1;
+    return test::realFunction<int (*)(char const*)>("remove")(name);
+}
+
+extern "C" int rename(char const* from, char const* to) noexcept {
+    if (test::failsNow(test::Call::RENAME)) return -1;
+    return test::realFunction<int (*)(char const*, char const*)>("rename")(from, to);
+}
+
+extern "C" int chmod(char const* name, mode_t mode) noexcept {
+    if (test::failsNow(test::Call::CHMOD)) return -1;
+    return test::realFunction<int (*)(char const*, mode_t)>("chmod")(name, mode);
+}
+
+extern "C" int access(char const* name, int how) noexcept {
+    if (test::failsNow(test::Call::ACCESS)) return -1;
+    return test::realFunction<int (*)(char const*, int)>("access")(name, how);
+}
+
+// By this name the fortified library calls realpath.
+// NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming)
+extern "C" char* __realpath_chk(char const* name, char* resolved, size_t size) {
+    if (test::failsNow(test::Call::RESOLVE)) return nullptr;
+    return test::realFunction<char* (*)(char const*, char*, size_t)>("__realpath_chk")(
+        name, resolved, size);
+}
+
+extern "C" int truncate(char const* name, off_t size) noexcept {
+    if (test::failsNow(test::Call::TRUNCATE)) return -1;
+    return test::realFunction<int (*)(char const*, off_t)>("truncate")(name, size);
 }
 
 #if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)

@@ -6,7 +6,7 @@
 
 #include <filesystem>
 #include <fstream>
-#include <iterator>
+#include <sstream>
 #include <stdexcept>
 #include <string>
 
@@ -51,7 +51,9 @@ inline void writeFile(std::string const& path, std::string const& bytes) {
 inline std::string readFile(std::string const& path) {
     std::ifstream in(path, std::ios::binary);
     if (!in) throw std::runtime_error("cannot read " + path);
-    return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+    std::ostringstream bytes;
+    bytes << in.rdbuf();
+    return bytes.str();
 }
 
 /// A file's place in a directory of its own, without the file at first.
