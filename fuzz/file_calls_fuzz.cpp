@@ -20,13 +20,18 @@ using Disk = std::map<std::wstring, std::string>;
 
 std::wstring const names[] = {L"a", L"b", L"\u00E9 c"};
 
+std::string makeFolder() {
+    for (std::string pattern : {"/dev/shm/koru-fuzz-XXXXXX", "/tmp/koru-fuzz-XXXXXX"}) {
+        if (::mkdtemp(&pattern[0]) != nullptr) return pattern;
+    }
+    return "";
+}
+
 /// A folder in memory where there is one, removed in the end.
 std::wstring const& folder() {
     static std::wstring const path = [] {
-        char pattern[] = "/dev/shm/koru-fuzz-XXXXXX";
-        KORU_CHECK(::mkdtemp(pattern) != nullptr);
-        static std::string made;
-        made = pattern;
+        static std::string const made = makeFolder();
+        KORU_CHECK(!made.empty());
         std::atexit([] {
             for (std::wstring const& name : names) File::remove(folder() + name);
             ::rmdir(made.c_str());
