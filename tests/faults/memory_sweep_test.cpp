@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <cstdio>
 #include <exception>
 #include <sstream>
 #include <stdexcept>
@@ -153,6 +154,8 @@ std::string complaintAbout(Scenario const& scenario, Result const& result,
 
 TEST_CASE("whichever allocation fails, nothing is lost, leaked or passed over in silence") {
     ::alarm(280);
+    // Its buffer would belong to whoever prints first.
+    std::setvbuf(stdout, nullptr, _IONBF, 0);
     test::keepFaultsOff = [](bool off) { mallocPlan.isAside = off; };
     std::vector<Scenario> const scenarios = allScenarios();
     REQUIRE(scenarios.size() >= 40);
