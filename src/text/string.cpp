@@ -149,7 +149,11 @@ _convert(In const* s, In const* end, std::basic_string<Out> const& nothing,
     if (s == end) return _toString(block, filled);
     std::basic_string<Out> result;
     result.reserve(filled + bound(s, static_cast<std::size_t>(end - s)));
-    for (result.append(block, filled); s != end; result.append(block, filled)) filled = fill();
+    result.append(block, filled);
+    while (s != end) {
+        filled = fill();
+        result.append(block, filled);
+    }
     return result;
 } catch (std::length_error const&) {
     throw std::bad_alloc();

@@ -468,11 +468,11 @@ TEST_CASE("a wait returns 0 when woken, 1 when time ran out, -1 for every other 
     std::pair<int, int> const rows[] = {{0, 0},          {ETIMEDOUT, 1},       {EINVAL, -1},
                                         {EPERM, -1},     {ENOMEM, -1},         {EINTR, -1},
                                         {EOVERFLOW, -1}, {ENOTRECOVERABLE, -1}};
-    for (auto const& [answer, expected] : rows) {
-        CAPTURE(answer);
+    for (auto const& row : rows) {
+        CAPTURE(row.first);
         Event event(true);
         event.signal();
-        CHECK(Answered(event, 5, answer).result == expected);
+        CHECK(Answered(event, 5, row.first).result == row.second);
         // In a child, since a mutex that stayed locked would stop it.
         REQUIRE(test::ending([&] { return event.test() && usable(event) ? 0 : 1; }) == "exit 0");
         CHECK(event.test());

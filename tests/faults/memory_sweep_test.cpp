@@ -94,7 +94,8 @@ std::vector<Scenario> allScenarios() {
     std::vector<Scenario> scenarios;
     test::addStructured(scenarios, 1, 20000);
     test::addStructured(scenarios, 350, 40);
-    test::addPlain(scenarios);
+    test::addStreams(scenarios);
+    test::addWholeFiles(scenarios);
     addValues(scenarios);
     return scenarios;
 }

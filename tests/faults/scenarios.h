@@ -8,6 +8,7 @@
 #include <iterator>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include <koru/file.h>
@@ -127,13 +128,18 @@ void addStructured(std::vector<Scenario>& scenarios, int entries, std::size_t si
     });
 }
 
-/// Scenarios of a plain file, of a log and of the operations on whole files.
-inline void addPlain(std::vector<Scenario>& scenarios) {
+/// Adds a scenario of a file that holds something.
+inline void addTo(std::vector<Scenario>& scenarios, char const* name,
+                  std::function<Report(Place const&)> work) {
+    scenarios.push_back({name, std::string(10000, 'b'), std::move(work)});
+}
+
+/// Scenarios of a plain file and of a log.
+inline void addStreams(std::vector<Scenario>& scenarios) {
     using Koru::File;
     using Koru::LogFile;
-    std::string const before(10000, 'b');
     auto const add = [&](char const* name, std::function<Report(Place const&)> work) {
-        scenarios.push_back({name, before, std::move(work)});
+        addTo(scenarios, name, std::move(work));
     };
     add("a file is read", [](Place const& place) {
         return workWith<File>(place, [](File& file) {
@@ -176,8 +182,13 @@ inline void addPlain(std::vector<Scenario>& scenarios) {
             return "";
         });
     });
+}
+
+/// Scenarios of the operations on whole files, and of a path.
+inline void addWholeFiles(std::vector<Scenario>& scenarios) {
+    using Koru::File;
     auto const addWhole = [&](char const* name, std::function<bool(std::wstring const&)> work) {
-        add(name, [work](Place const& place) {
+        addTo(scenarios, name, [work](Place const& place) {
             Report report;
             report.succeeded = work(std::wstring(place.path().begin(), place.path().end()));
             return report;
@@ -191,7 +202,7 @@ inline void addPlain(std::vector<Scenario>& scenarios) {
              [](std::wstring const& path) { return File::rename(path, path + L".to"); });
     addWhole("a file is found", [](std::wstring const& path) { return File::exists(path); });
     // What it comes to without the name of the executable is no failure.
-    add("a relative path is resolved", [](Place const&) {
+    addTo(scenarios, "a relative path is resolved", [](Place const&) {
         Report report;
         try {
             report.succeeded = !File::Path(L"some/file").getName().empty();

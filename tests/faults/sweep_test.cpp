@@ -53,7 +53,8 @@ std::vector<Scenario> allScenarios() {
     std::vector<Scenario> scenarios;
     test::addStructured(scenarios, 1, 5);
     test::addStructured(scenarios, 1, 20000);
-    test::addPlain(scenarios);
+    test::addStreams(scenarios);
+    test::addWholeFiles(scenarios);
     return scenarios;
 }
 

@@ -411,12 +411,12 @@ TEST_CASE_FIXTURE(OnFile, "a name reaches the system as UTF-8 and up to its firs
         {L"back\\slash", "back\\slash"},
         {{static_cast<wchar_t>(0x80000041U)}, "A"},
         {{static_cast<wchar_t>(0xD800)}, "\xED\xA0\x80"}};
-    for (auto const& [name, bytes] : rows) {
-        CAPTURE(bytes);
-        File other(dir.wide("") + name);
+    for (auto const& row : rows) {
+        CAPTURE(row.second);
+        File other(dir.wide("") + row.first);
         other.open(WRITE);
-        CHECK(isThere(dir / bytes));
-        CHECK((other.getName() == dir.wide("") + name));
+        CHECK(isThere(dir / row.second));
+        CHECK((other.getName() == dir.wide("") + row.first));
     }
 }
 

@@ -371,8 +371,8 @@ TEST_CASE("a default path has three empty parts") {
 TEST_CASE("an absolute path is split at its last slash, slashes made one, nothing resolved") {
     auto const check = [](Strings const& rows) {
         for (std::string const& row : rows) {
+            CAPTURE(row);
             auto const [text, parts] = cells(row);
-            CAPTURE(text);
             CHECK(parsedInEveryKind(text) == parts);
             Path const path(text);
             CHECK(std::wstring(path) == path.getDirectory() + path.getName());

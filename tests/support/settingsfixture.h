@@ -23,7 +23,7 @@ unsigned long const READ_WRITE = Koru::File::READ | Koru::File::WRITE;
 
 /// The place of a file object, made before it and removed after it.
 struct HasPlace {
-    Place const place;
+    Place const place{};
 };
 
 /// A settings file of its own. With bytes it is there and open, without it is not.

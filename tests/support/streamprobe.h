@@ -47,11 +47,11 @@ public:
 protected:
     int_type overflow(int_type c) override {
         for (char const* p = pbase(); p != pptr(); ++p) {
-            if (!_take(*p)) return traits_type::eof();
+            if (!take(*p)) return traits_type::eof();
         }
         setp(pbase(), epptr());
         if (traits_type::eq_int_type(c, traits_type::eof())) return traits_type::not_eof(c);
-        return _take(traits_type::to_char_type(c)) ? c : traits_type::eof();
+        return take(traits_type::to_char_type(c)) ? c : traits_type::eof();
     }
     int sync() override {
         log_ += "<sync>";
@@ -59,7 +59,7 @@ protected:
     }
 
 private:
-    bool _take(char c) {
+    bool take(char c) {
         if (taken_ == setup_.throwAt) throw SinkFailure();
         if (taken_ >= setup_.room) return false;
         ++taken_;
