@@ -28,16 +28,15 @@ std::string stateOnDisk(Place const& place, std::string const& newValue) {
     if (bytes == Family::bytes(0, 1, OLD_VALUE)) return "old";
     std::string const whole = Family::bytes(0, 1, newValue);
     if (bytes == whole) return "new";
-    return whole.compare(0, bytes.size(), bytes) == 0 ? "part of the new" : "damaged";
+    return whole.compare(0, bytes.size(), bytes) == 0 ? "a part" : "damaged";
 }
 
 /// The states that are left when `writeBack` is killed at its first system call, its second and so
-/// on, each named once for as long as it lasts.
+/// on, each named once. (One run may need a call for memory that another one does without.)
 template <class Family, class WriteBack>
 std::string statesLeft(std::string const& newValue, WriteBack writeBack) {
     Place const place;
     std::string states;
-    std::string last;
     bool isKilled = true;
     for (long call = 0; isKilled; ++call) {
         place.write(Family::bytes(0, 1, OLD_VALUE));
@@ -46,8 +45,7 @@ std::string statesLeft(std::string const& newValue, WriteBack writeBack) {
         Family::set(*file, 0, newValue);
         isKilled = killedAtCall(call, [&] { writeBack(file); });
         std::string const state = stateOnDisk<Family>(place, newValue);
-        if (state != last) states += (last.empty() ? "" : ", ") + state;
-        last = state;
+        if (states.find(state) == std::string::npos) states += (call == 0 ? "" : ", ") + state;
         file->setMode(0);
         delete file;
     }
@@ -71,6 +69,6 @@ TEST_CASE_TEMPLATE("a killed write-back of much writes settings at once and reco
     using File = typename Family::File;
     bool const isInPieces = std::is_same<Family, Records>::value;
     std::string const expected =
-        isInPieces ? "old, missing, empty, part of the new, new" : "old, missing, empty, new";
+        isInPieces ? "old, missing, empty, a part, new" : "old, missing, empty, new";
     CHECK(statesLeft<Family>(much, [](File* file) { file->close(); }) == expected);
 }
