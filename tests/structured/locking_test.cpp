@@ -270,7 +270,12 @@ FAMILIES_TEST_CASE("edits of several threads are not lost while others synchroni
         for (int i = 0; i < 15; ++i) file.synchronize();
     });
     threads.emplace_back([&file] {
-        for (int i = 0; i < 15; ++i) file.count();
+        for (int i = 0; i < 15; ++i) {
+            // A record must not go while its key is looked at.
+            file.lock();
+            file.count();
+            file.unlock();
+        }
     });
     for (std::thread& thread : threads) thread.join();
     file.synchronize();
