@@ -100,8 +100,6 @@ std::vector<Scenario> allScenarios() {
     return scenarios;
 }
 
-std::string onDisk(Place const& place) { return place.exists() ? place.bytes() : "nothing"; }
-
 /// How often each byte is there: what a record file holds is the same in any order of its records.
 std::array<long, 256> countBytes(std::string const& bytes) {
     std::array<long, 256> counts = {};
@@ -132,7 +130,7 @@ Result run(Scenario const& scenario, Place const& place, long before, bool forev
     }
     if (report.seen.capacity() > std::string().capacity()) --result.leaked;
     result.report = std::move(report);
-    result.left = onDisk(place);
+    result.left = test::onDisk(place);
     return result;
 }
 

@@ -35,6 +35,9 @@ struct Scenario {
     std::function<Report(Place const&)> work;
 };
 
+/// What a scenario has left on the disk.
+inline std::string onDisk(Place const& place) { return place.exists() ? place.bytes() : "nothing"; }
+
 /// How a sweep keeps its faults off what a scenario does only to check; null where they are no
 /// hindrance.
 inline void (*keepFaultsOff)(bool) = nullptr;

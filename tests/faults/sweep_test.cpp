@@ -26,10 +26,6 @@ using test::ShortTransfers;
 
 namespace {
 
-/// What is left on the disk. What a record file holds is the same in any order, but there is one
-/// record only.
-std::string onDisk(Place const& place) { return place.exists() ? place.bytes() : "nothing"; }
-
 /// What a scenario comes to.
 struct Result {
     Report report;
@@ -44,7 +40,7 @@ Result run(Scenario const& scenario, Place const& place, MakeFault makeFault) {
         [[maybe_unused]] auto const fault = makeFault();
         result.report = scenario.work(place);
     }
-    result.left = onDisk(place);
+    result.left = test::onDisk(place);
     return result;
 }
 

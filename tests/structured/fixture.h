@@ -36,14 +36,11 @@ std::string complaint(Callable callable) {
     return messageOf<std::runtime_error>(callable);
 }
 
-/// The place of a file object, made before it and removed after it.
-struct HasPlace {
-    Place const place{};
-};
+;
 
 /// A structured file in a place of its own. With bytes it is there, with a mode it is open, too.
 template <class Family>
-class OwnFile : public HasPlace, public Family::File {
+class OwnFile : public test::HasPlace, public Family::File {
 public:
     OwnFile() : Family::File(place.path()) {}
     explicit OwnFile(std::string const& bytes) : OwnFile() { place.write(bytes); }

@@ -8,11 +8,6 @@
 
 namespace test {
 
-/// The base that makes a place before the file object and removes it afterwards.
-struct HasPlace {
-    Place const place{};
-};
-
 /// A file object in a place of its own. With a mode it is open, with bytes they are in the file.
 template <class File>
 class OwnFile : public HasPlace, public File {

@@ -21,11 +21,6 @@ unsigned long const READ = Koru::File::READ;
 unsigned long const WRITE = Koru::File::WRITE;
 unsigned long const READ_WRITE = Koru::File::READ | Koru::File::WRITE;
 
-/// The place of a file object, made before it and removed after it.
-struct HasPlace {
-    Place const place{};
-};
-
 /// A settings file of its own. With bytes it is there and open, without it is not.
 class SettingsFile : public HasPlace, public Koru::InitializationFile {
 public:

@@ -74,6 +74,11 @@ private:
     std::string path_ = directory_ / "file";
 };
 
+/// The base of a file object that makes its place before it and removes it after it.
+struct HasPlace {
+    Place const place{};
+};
+
 } // namespace test
 
 #endif
