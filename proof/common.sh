@@ -1,0 +1,16 @@
+# Shared by the parts of script/proof, which source it: PART FILE-FOR-THE-ROWS. A part also runs
+# without that script; its rows then go to the terminal.
+# shellcheck shell=bash
+source "$(dirname "${BASH_SOURCE[0]}")/../script/common.sh"
+
+part=$(basename "$0")
+rows=${1:-/dev/stdout}
+# shellcheck disable=SC2034 # the parts use it
+factor=${KORU_PROOF_FACTOR:-1}
+# Where a part keeps what it has done, as PART.ANYTHING.
+kept=${KORU_PROOF_KEPT:-$PWD/build/proof}
+mkdir -p "$kept"
+if [[ -f $rows ]]; then rm "$rows"; fi
+
+# figure WHAT RESULT: a row of the table.
+figure() { echo "| $1 | $2 | \`script/proof $part\` |" >>"$rows"; }
