@@ -1,5 +1,4 @@
-// Any calls on a sectioned settings file do what they do to the plain model of it, from any bytes
-// at the start to the bytes at the end.
+// Any calls on a sectioned settings file do what they do to the plain model of it.
 #include <koru/initializationfile.h>
 
 #include <cstdint>
@@ -7,12 +6,11 @@
 
 #include "check.h"
 #include "input.h"
-#include "memoryfile.h"
+#include "settingsplay.h"
 #include "support/settingsmodel.h"
 
 namespace {
 
-using Koru::File;
 using Koru::InitializationFile;
 using Model = test::SettingsFileModel;
 
@@ -48,52 +46,9 @@ void change(fuzz::Input& input, InitializationFile& file, Model& model) {
     KORU_CHECK(file.enumerateSections() == model.enumerateSections());
 }
 
-void moveOn(fuzz::Input& input, InitializationFile& file, Model& model) {
-    unsigned long const mode = 1 + input.below(3);
-    switch (input.below(4)) {
-    case 0:
-        if (model.isOpen()) break;
-        file.open(mode);
-        model.open(mode);
-        break;
-    case 1:
-        file.close();
-        model.close();
-        break;
-    case 2:
-        file.setMode(mode);
-        model.setMode(mode);
-        break;
-    default:
-        file.synchronize();
-        model.synchronize();
-        break;
-    }
-}
-
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size) {
-    static fuzz::MemoryFile const memory;
-    fuzz::Input input(data, size);
-    Model model;
-    model.exists = true;
-    for (unsigned pieces = input.below(8); pieces > 0; --pieces) model.bytes += input.bytes();
-    memory.write(model.bytes);
-    {
-        InitializationFile file(memory.path());
-        file.open(File::READ | File::WRITE);
-        model.open(File::READ | File::WRITE);
-        while (!input.isAtEnd()) {
-            if (input.below(4) == 0)
-                moveOn(input, file, model);
-            else
-                change(input, file, model);
-            KORU_CHECK(file.is_open() == model.isOpen() && file.getMode() == model.getMode());
-        }
-        // The destructor closes the file, and writes one that is closed too if the mode says so.
-        model.close();
-    }
-    KORU_CHECK(memory.bytes() == model.bytes);
+    fuzz::playSettings<InitializationFile, Model>(data, size, change);
     return 0;
 }

@@ -15,108 +15,13 @@
 
 #include "structured/lines.h"
 #include "support/choices.h"
+#include "support/propertymodel.h"
 
 using namespace structured;
 using namespace std::string_literals;
 using test::Dice;
 
 namespace {
-
-std::string untilZero(std::string const& bytes) { return bytes.substr(0, bytes.find('\0')); }
-
-/// Parses one line; a key that stays empty means that it adds nothing.
-Property parseLine(std::string line) {
-    std::size_t const first = line.find_first_not_of("\t ");
-    if (first != std::string::npos) line.erase(0, first);
-    std::size_t const last = line.find_last_not_of("\t ");
-    if (last != std::string::npos) line.erase(last + 1);
-
-    if (!line.empty() && (line[0] == '#' || line[0] == ';')) return {};
-    std::size_t const equals = line.find('=');
-    if (equals == std::string::npos) return {L"", Koru::make_wstring(untilZero(line))};
-    return {Koru::make_wstring(untilZero(line.substr(0, equals))),
-            Koru::make_wstring(untilZero(line.substr(equals + 1)))};
-}
-
-Properties parse(std::string const& bytes) {
-    Properties list;
-    for (std::size_t at = 0; at < bytes.size();) {
-        std::size_t const end = std::min(bytes.find('\n', at), bytes.size());
-        Property const property = parseLine(bytes.substr(at, end - at));
-        if (!property.key.empty()) list.push_back(property);
-        at = end + 1;
-    }
-    return list;
-}
-
-/// What a property file does, in the plainest way: a list, every operation a loop over all of it,
-/// and a file that is a string.
-class Model {
-public:
-    Properties list;
-    bool exists = true; ///< whether the file is on the disk
-    std::string bytes;  ///< what it holds then
-
-    bool isOpen() const { return open_; }
-    unsigned long getMode() const { return mode_; }
-    void setMode(unsigned long mode) { mode_ = mode; }
-
-    /// @throws std::runtime_error where the library does
-    void open(unsigned long mode) {
-        bool const reads = (mode & READ) != 0;
-        bool const writes = (mode & WRITE) != 0;
-        if (!open_) {
-            if (!writes && !(reads && exists)) throw std::runtime_error(NOT_OPENED);
-            if (!reads || !exists) bytes.clear();
-            exists = true;
-            open_ = true;
-            readable_ = reads;
-        }
-        mode_ = mode;
-        list = reads && readable_ ? parse(bytes) : Properties();
-    }
-
-    void close() {
-        exists = exists || (mode_ & WRITE) != 0;
-        if ((mode_ & WRITE) != 0) bytes = textOf(list);
-        list.clear();
-        open_ = false;
-        mode_ = 0;
-    }
-
-    void synchronize() {
-        if (!open_) return;
-        unsigned long const mode = mode_;
-        close();
-        open(mode);
-    }
-
-    void createKey(std::wstring const& key) {
-        if (find(key) == list.end()) list.push_back({key, L""});
-    }
-    void removeKey(std::wstring const& key) {
-        auto const at = find(key);
-        if (at != list.end()) list.erase(at);
-    }
-    std::wstring getValue(std::wstring const& key) {
-        auto const at = find(key);
-        return at != list.end() ? at->value : L"";
-    }
-    void setValue(std::wstring const& key, std::wstring const& value) {
-        createKey(key);
-        find(key)->value = value;
-    }
-
-private:
-    bool open_ = false;
-    bool readable_ = false; // of the open stream, whatever mode was set since
-    unsigned long mode_ = 0;
-
-    Properties::iterator find(std::wstring const& key) {
-        return std::find_if(list.begin(), list.end(),
-                            [&](Property const& p) { return Koru::compare(p.key, key) == 0; });
-    }
-};
 
 void checkSame(Properties const& actual, Properties const& expected) {
     bool const same = actual == expected;
@@ -133,7 +38,7 @@ void checkSame(std::string const& actual, std::string const& expected) {
 /// The library's file and the model, given the same steps.
 struct Twins {
     Lines<Flat> file;
-    Model model;
+    test::PropertyFileModel model;
 
     explicit Twins(std::string const& bytes = "") : file(bytes, READ_WRITE) {
         model.bytes = bytes;
@@ -261,7 +166,7 @@ TEST_CASE("every line of up to five characters of the syntax is read alone in a 
         CAPTURE(test::shown(line));
         file.place.write(line);
         file.open(READ);
-        Properties const list = parse(line);
+        Properties const list = test::parseProperties(line);
         bool const same = file.count() == list.size() &&
                           (list.empty() || (file.enumerateKeys()[0] == list[0].key &&
                                             file.getValue(list[0].key) == list[0].value));

@@ -9,42 +9,15 @@
 #include <string>
 #include <vector>
 
-#include <koru/string.h>
-
 #include "structured/fixture.h"
+#include "support/propertymodel.h"
 #include "support/shown.h"
 
 namespace structured {
 
-struct Property {
-    std::wstring key;
-    std::wstring value;
-};
-
-inline bool operator==(Property const& a, Property const& b) {
-    return a.key == b.key && a.value == b.value;
-}
-
-using Properties = std::vector<Property>;
-
-/// Like "key/value | key/value".
-inline std::string shown(Properties const& list) {
-    std::string result;
-    for (Property const& p : list) {
-        if (!result.empty()) result += " | ";
-        result += test::shown(p.key) + '/' + test::shown(p.value);
-    }
-    return result;
-}
-
-/// The lines that are written for entries in this order.
-inline std::string textOf(Properties const& list) {
-    std::string text;
-    for (Property const& p : list) {
-        text += Koru::make_string(p.key) + "=" + Koru::make_string(p.value) + "\n";
-    }
-    return text;
-}
+using test::Properties;
+using test::Property;
+using test::textOf;
 
 /// A settings file of these lines in a place of its own, open.
 template <class Family>
