@@ -382,8 +382,20 @@ TEST_CASE("the first argument is read at every call, as the process may overwrit
         Strings{dir / "prog1", dir / "prog2"});
 }
 
+namespace {
+
+/// Leaves text where the stack of the next call will be.
+[[gnu::noinline]] void soilStack() {
+    char text[32 * 1024];
+    std::memset(text, '/', sizeof text);
+    asm volatile("" : : "r"(text) : "memory");
+}
+
+} // namespace
+
 TEST_CASE("a process that can open no file has an empty name") {
     test::Outcome const outcome = test::inChild([] {
+        soilStack();
         rlimit limit{0, 0};
         ::getrlimit(RLIMIT_NOFILE, &limit);
         rlimit const none{0, limit.rlim_max}; // descriptors

@@ -440,6 +440,17 @@ TEST_CASE("the bound is the size of the encoded text, or more where it ends earl
     }
 }
 
+TEST_CASE("the bound has room for the last and the first character of each size") {
+    for (wchar_t const c : ODD_UNITS) {
+        if (modelOf(std::wstring(1, c)).empty()) continue; // It ends the text.
+        CAPTURE(static_cast<std::uint32_t>(c));
+        for (std::size_t size = 1; size <= 40; ++size) {
+            std::wstring const text(size, c);
+            CHECK(Koru::encodedBound(text.data(), text.size()) == modelOf(text).size());
+        }
+    }
+}
+
 TEST_CASE("the bound leaves out what comes after a NUL, but for less than a step") {
     for (wchar_t const c : {L'x', L'\u4E2D', wchar_t{-1}}) {
         for (std::size_t before = 0; before <= 40; ++before) {
