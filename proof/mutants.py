@@ -126,15 +126,23 @@ def chosen(mutants, seed):
 
 
 def copy_tree(source, target):
-    """What git knows of the tree, as it is now."""
-    shutil.rmtree(target, ignore_errors=True)
+    """What git knows of the tree, as it is now. What was built of an earlier copy stays."""
     listed = subprocess.run(["git", "-c", f"safe.directory={source}", "ls-files", "-z", "--cached",
                              "--others", "--exclude-standard"], cwd=source, check=True,
                             stdout=subprocess.PIPE).stdout
-    for name in listed.decode().split("\0"):
-        if name and (source / name).is_file():
-            (target / name).parent.mkdir(parents=True, exist_ok=True)
-            shutil.copy2(source / name, target / name)
+    names = {name for name in listed.decode().split("\0") if name and (source / name).is_file()}
+    if target.is_dir():
+        for old in [path for path in target.rglob("*") if path.is_file()]:
+            name = str(old.relative_to(target))
+            if not name.startswith("build/") and name not in names:
+                old.unlink()
+    for name in names:
+        copy = target / name
+        if copy.is_file() and copy.read_bytes() == (source / name).read_bytes():
+            continue
+        copy.parent.mkdir(parents=True, exist_ok=True)
+        shutil.copyfile(source / name, copy)
+        shutil.copymode(source / name, copy)
 
 
 class Suite:
