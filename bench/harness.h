@@ -214,7 +214,7 @@ private:
     }
 
     /// How many runs make a series long enough for the clock; also warms up. Preparation, which is
-    /// not timed, counts here, or a cheap body behind a dear preparation would take forever.
+    /// not timed, counts here, or a cheap body after a dear preparation would take forever.
     static std::size_t calibrate(Work const& work) {
         double const enough = 0.0005;
         for (std::size_t count = 1;; count *= 2) {

@@ -73,7 +73,7 @@ std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint 
 
 namespace {
 
-/// How many characters of a name count. That names which differ only behind them have one number
+/// How many characters of a name count. That names which differ only after them have one number
 /// costs comparisons, no more.
 constexpr std::size_t MOST = 256;
 

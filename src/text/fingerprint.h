@@ -36,7 +36,7 @@ constexpr std::uint32_t classOf(std::uint32_t c) {
 std::uint32_t mixFingerprint(std::uint32_t before, char const* name, std::size_t size);
 std::uint32_t mixFingerprint(std::uint32_t before, wchar_t const* name, std::size_t size);
 
-/// The number that stands in a column, from what was mixed.
+/// The number for a column, from what was mixed.
 inline Fingerprint toFingerprint(std::uint32_t mixed) {
     return static_cast<Fingerprint>(mixed >> 16);
 }

@@ -242,11 +242,11 @@ TEST_CASE("the first argument ends at its first blank") {
     std::string const spaced = dir / "bin/the prog";
     std::string const below = dir / "my apps/bin/prog";
 
-    SUBCASE("what stands before the blank need not exist") {
+    SUBCASE("what comes before the blank need not exist") {
         checkAsRealpath(spaced, spaced, dir / "elsewhere");
         checkAsRealpath(below, below, dir / "elsewhere");
     }
-    SUBCASE("what stands before the blank is resolved where it exists") {
+    SUBCASE("what comes before the blank is resolved where it exists") {
         test::writeFile(dir / "bin/the", "");
         std::filesystem::create_directory_symlink("elsewhere", dir / "my");
         CHECK(nameOf(spaced, spaced) == dir / "bin/the");

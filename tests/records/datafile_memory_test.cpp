@@ -199,7 +199,7 @@ TEST_CASE("when memory runs out in setKey or setData, the record keeps a key and
     });
 }
 
-TEST_CASE("when memory runs out in the constructor, nothing is left behind") {
+TEST_CASE("when memory runs out in the constructor, nothing is left") {
     Place const place;
     Koru::File::Path const path(place.path());
     forEachFailure([&](MemoryPlan const& plan) {

@@ -175,7 +175,7 @@ TEST_CASE("the samples have the traits that they are there for") {
     CHECK(theme.find('\n', longest) - longest > 11000);
 }
 
-TEST_CASE("every key line of a sample comes out as it stands there") {
+TEST_CASE("every key line of a sample comes out as it is there") {
     forEachSample(READ, [](Sample const& sample, SettingsFile& file) {
         CHECK(file.enumerateSections().size() == sample.sections);
         // Of equal entries the first of the file comes first; removing it uncovers the next.

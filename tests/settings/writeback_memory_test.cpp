@@ -260,7 +260,7 @@ TEST_CASE("when memory runs out in a change, it is made whole or not at all") {
     }
 }
 
-TEST_CASE("when memory runs out in the constructor, nothing is left behind") {
+TEST_CASE("when memory runs out in the constructor, nothing is left") {
     Place const place;
     Koru::File::Path const path(place.path());
     forEachFailure([&path](MemoryPlan const& plan) {

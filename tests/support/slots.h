@@ -1,4 +1,4 @@
-// Where a virtual operation stands in the table of its class, which programs built before rely on.
+// Where a virtual operation is in the table of its class, which programs built before rely on.
 #ifndef KORU_TESTS_SLOTS_H
 #define KORU_TESTS_SLOTS_H
 

@@ -156,7 +156,7 @@ TEST_CASE("a library object holds a name and a handle besides its virtual table"
     CHECK(std::is_copy_assignable_v<DynamicLibrary>);
 }
 
-TEST_CASE("the virtual functions are load, unload and isLoaded, behind the destructor's two") {
+TEST_CASE("the virtual functions are load, unload and isLoaded, after the destructor's two") {
     CHECK(test::slotOf(&DynamicLibrary::load) == 2);
     CHECK(test::slotOf(&DynamicLibrary::unload) == 3);
     CHECK(test::slotOf(&DynamicLibrary::isLoaded) == 4);

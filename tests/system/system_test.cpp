@@ -246,7 +246,7 @@ TEST_CASE("the official name is the resolver's, read as UTF-8, not the name that
     CHECK(System::getIpHostName() == L"b\u00FCcher.example");
 }
 
-TEST_CASE("every query asks anew") {
+TEST_CASE("every query asks again") {
     Host host("first.example", {"192.0.2.1"});
     host.name = "before";
     CHECK(answers() == "before|first.example|192.0.2.1");

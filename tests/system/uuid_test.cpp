@@ -292,7 +292,7 @@ TEST_CASE("text ends at its first NUL") {
     }
 }
 
-TEST_CASE("any character but digits and hyphens is refused, wherever it stands") {
+TEST_CASE("any character but digits and hyphens is refused, wherever it is") {
     for (std::size_t at = 0; at < 36; ++at) {
         CAPTURE(at);
         for (int value = 1; value < 256; ++value) {
@@ -406,7 +406,7 @@ TEST_CASE("the inserter writes the text and returns the stream") {
     CHECK(out.str() == TEXT + "|" + ZERO_TEXT);
 }
 
-TEST_CASE("width and fill go to the first character, before or behind it") {
+TEST_CASE("width and fill go to the first character, before or after it") {
     std::ostringstream out;
     out << std::setw(5) << std::setfill('*') << Uuid(BYTES);
     CHECK(out.width() == 0);
