@@ -6,6 +6,8 @@
 #include <numeric>
 #include <utility>
 
+#include <koru/string.h>
+
 #include "text/convert.h"
 
 namespace Koru {
@@ -35,8 +37,26 @@ StoredText SettingsTable::view(std::string_view bytes) {
     if (isPlain(bytes)) return StoredText(bytes);
     std::string_view const text = bytes.substr(0, bytes.find('\0'));
     if (isCanonical(text)) return StoredText(text);
-    std::wstring const decoded = make_wstring(text.data(), text.size());
-    return decoded.empty() ? StoredText() : hold(decoded);
+    return viewDecoded(text);
+}
+
+/// Malformed text becomes the bytes of what it decodes to, in its place: no character takes more of
+/// them than it was decoded from. A wide string for each text took 25 times the size of the file.
+StoredText SettingsTable::viewDecoded(std::string_view text) {
+    std::string const bytes = make_string(make_wstring(text.data(), text.size()));
+    char* const place = bytes_.data.get() + (text.data() - bytes_.data.get());
+    std::copy(bytes.begin(), bytes.end(), place);
+    return StoredText(std::string_view(place, bytes.size()));
+}
+
+/// Makes room for as many entries as the lines from this one on may have. To double what there is
+/// would take three times the memory of the entries, while they move.
+void SettingsTable::makeRoomFrom(char const* line) {
+    constexpr std::size_t shortestLine = 3; // bytes, the line feed included
+    char const* const end = bytes_.data.get() + bytes_.size;
+    std::size_t const most = static_cast<std::size_t>(end - line) / shortestLine;
+    auto const lines = static_cast<std::size_t>(std::count(line, end, '\n'));
+    entries_.reserve(entries_.size() + std::min(lines, most) + 1);
 }
 
 std::uint32_t SettingsTable::addSection(StoredText const& name) {
@@ -129,7 +149,8 @@ void SettingsTable::add(std::wstring const& section, std::wstring const& key,
         entries_.reserve(std::min(2 * entries_.size() + 8, entries_.max_size()));
     std::uint32_t const number = addSection(section);
     StoredText const heldKey = hold(key);
-    add(number, heldKey, hold(value));
+    StoredText const heldValue = hold(value);
+    entries_.emplace_back(number, heldKey, heldValue);
 }
 
 void SettingsTable::create(std::wstring const& section, std::wstring const& key) {

@@ -55,7 +55,7 @@ public:
     std::string_view heldBytes() const { return bytes_.view(); }
 
     /// A view of a part of the held bytes, as make_wstring converts it: the text ends at its first
-    /// NUL, and where it is not well-formed the table holds what it decodes to.
+    /// NUL. Where it is not well-formed, what it decodes to takes its place.
     StoredText view(std::string_view bytes);
 
     /// The same where it is known whether the line of that part is plain.
@@ -66,8 +66,9 @@ public:
     /// Adds the name of a section and returns its number for `Entry`.
     std::uint32_t addSection(StoredText const& name);
 
-    /// Adds an entry of views.
-    void add(std::uint32_t section, StoredText const& key, StoredText const& value) {
+    /// Adds an entry of views; the key is a part of the held bytes.
+    void addView(std::uint32_t section, StoredText const& key, StoredText const& value) {
+        if (entries_.size() == entries_.capacity()) makeRoomFrom(key.bytes().data());
         entries_.emplace_back(section, key, value);
     }
 
@@ -114,6 +115,8 @@ private:
     class SectionMatcher;
 
     std::size_t find(std::wstring const& section, std::wstring const& key);
+    StoredText viewDecoded(std::string_view text);
+    void makeRoomFrom(char const* line);
     StoredText hold(std::wstring const& text);
     void release(StoredText const& text) noexcept;
     void release(Entry const& entry) noexcept;

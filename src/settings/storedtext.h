@@ -1,9 +1,9 @@
 // How a settings table keeps its text.
 //
 // Opening a file makes three strings of every line, and most programs look at few of them. So text
-// from a file stays where it was read, as bytes, and is widened when somebody asks for it. That
-// works for text whose bytes are just what make_string gives for its characters; other text, and
-// what callers set, is kept as a wide string.
+// from a file stays where it was read, as bytes, and is widened when somebody asks for it. These are
+// just the bytes that make_string gives for its characters; where the file has others, they have
+// been replaced. What callers set is kept as a wide string.
 #ifndef KORU_SETTINGS_STOREDTEXT_H
 #define KORU_SETTINGS_STOREDTEXT_H
 
@@ -24,7 +24,7 @@ class StoredText {
 public:
     StoredText() : bytes_(""), size_(0) {}
 
-    /// Bytes for which `isPlain` or `isCanonical` holds.
+    /// Bytes that make_string gives for what make_wstring makes of them.
     explicit StoredText(std::string_view bytes) : bytes_(bytes.data()), size_(bytes.size()) {}
 
     /// A wide string of any content.
