@@ -86,8 +86,10 @@ void FileReader::readAll(FileBytes& bytes) {
     std::size_t const hint = sizeHint();
     std::size_t capacity = _grow(bytes, 1, std::min(hint, FIRST_CAPACITY_MOST));
     while (std::size_t const portion = arrived()) {
-        if (portion > capacity - bytes.size)
-            capacity = _grow(bytes, bytes.size + portion, std::max(2 * capacity, hint));
+        if (portion > capacity - bytes.size) {
+            std::size_t const wished = hint > capacity ? hint : 2 * capacity;
+            capacity = _grow(bytes, bytes.size + portion, wished);
+        }
         bytes.size += take(bytes.data.get() + bytes.size, portion);
     }
     if (hasFailed()) throw std::runtime_error("failed to read from file");

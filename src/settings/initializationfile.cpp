@@ -58,7 +58,7 @@ public:
         if (key.empty() || section_.empty()) return;
         // Neither is trimmed: blanks around "=" belong to key and value.
         StoredText const value = table_.view(line.substr(equals + 1), plain);
-        table_.addView(sectionNumber(), key, value);
+        table_.add(sectionNumber(), key, value);
     }
 
 private:

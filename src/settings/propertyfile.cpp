@@ -40,7 +40,7 @@ void _parse(std::string_view line, bool plain, SettingsTable& list) {
     StoredText const key = list.view(line.substr(0, equals), plain);
     if (key.empty()) return;
     // Neither is trimmed: blanks around "=" belong to key and value.
-    list.addView(0, key, list.view(line.substr(equals + 1), plain));
+    list.add(0, key, list.view(line.substr(equals + 1), plain));
 }
 
 void _read(FileReader& reader, SettingsTable& list) {

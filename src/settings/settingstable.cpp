@@ -49,16 +49,6 @@ StoredText SettingsTable::viewDecoded(std::string_view text) {
     return StoredText(std::string_view(place, bytes.size()));
 }
 
-/// Makes room for as many entries as the lines from this one on may have. To double what there is
-/// would take three times the memory of the entries, while they move.
-void SettingsTable::makeRoomFrom(char const* line) {
-    constexpr std::size_t shortestLine = 3; // bytes, the line feed included
-    char const* const end = bytes_.data.get() + bytes_.size;
-    std::size_t const most = static_cast<std::size_t>(end - line) / shortestLine;
-    auto const lines = static_cast<std::size_t>(std::count(line, end, '\n'));
-    entries_.reserve(entries_.size() + std::min(lines, most) + 1);
-}
-
 std::uint32_t SettingsTable::addSection(StoredText const& name) {
     sections_.push_back(name);
     return static_cast<std::uint32_t>(sections_.size() - 1);
@@ -149,8 +139,7 @@ void SettingsTable::add(std::wstring const& section, std::wstring const& key,
         entries_.reserve(std::min(2 * entries_.size() + 8, entries_.max_size()));
     std::uint32_t const number = addSection(section);
     StoredText const heldKey = hold(key);
-    StoredText const heldValue = hold(value);
-    entries_.emplace_back(number, heldKey, heldValue);
+    add(number, heldKey, hold(value));
 }
 
 void SettingsTable::create(std::wstring const& section, std::wstring const& key) {

@@ -66,9 +66,8 @@ public:
     /// Adds the name of a section and returns its number for `Entry`.
     std::uint32_t addSection(StoredText const& name);
 
-    /// Adds an entry of views; the key is a part of the held bytes.
-    void addView(std::uint32_t section, StoredText const& key, StoredText const& value) {
-        if (entries_.size() == entries_.capacity()) makeRoomFrom(key.bytes().data());
+    /// Adds an entry of views.
+    void add(std::uint32_t section, StoredText const& key, StoredText const& value) {
         entries_.emplace_back(section, key, value);
     }
 
@@ -116,7 +115,6 @@ private:
 
     std::size_t find(std::wstring const& section, std::wstring const& key);
     StoredText viewDecoded(std::string_view text);
-    void makeRoomFrom(char const* line);
     StoredText hold(std::wstring const& text);
     void release(StoredText const& text) noexcept;
     void release(Entry const& entry) noexcept;
