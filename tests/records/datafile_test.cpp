@@ -22,6 +22,7 @@
 
 #include "records/recordfixture.h"
 #include "support/shown.h"
+#include "support/skip.h"
 #include "support/slots.h"
 #include "support/throws.h"
 
@@ -496,7 +497,7 @@ TEST_CASE("an argument's key may come from the file itself or not at all") {
 
 TEST_CASE("keys are compared under the C locale of the moment") {
     if (std::setlocale(LC_ALL, "C.UTF-8") == nullptr) {
-        MESSAGE("there is no C.UTF-8 locale: keys were not compared under it");
+        test::skipped("there is no locale C.UTF-8");
         return;
     }
     std::setlocale(LC_ALL, "C");

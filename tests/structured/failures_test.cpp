@@ -17,6 +17,7 @@
 #include <string>
 
 #include "structured/fixture.h"
+#include "support/skip.h"
 #include "support/subprocess.h"
 #include "support/systemcalls.h"
 
@@ -321,7 +322,7 @@ FAMILIES_TEST_CASE("a full disk is a failure to write") {
         return text + after(file, READ_WRITE, [&] { file.close(); });
     }); // the destructor met the full disk once more
     if (told == CANNOT_MOUNT) {
-        MESSAGE("no file system can be mounted here: the full disk was not tested");
+        test::skipped("no file system can be mounted");
         return;
     }
     CHECK(told == ended(NOT_WRITTEN, 100000) + ended(NOT_WRITTEN, 100000) + ended(NOTHING, 5) +
@@ -358,7 +359,7 @@ void checkReplacements(Place const& place, Replace replace) {
         std::string const* const value = i < 3 ? &NEW_VALUES[i] : nullptr;
         std::string const told = replace(value);
         if (told == CANNOT_MOUNT) {
-            MESSAGE("nothing can be mounted here: the undeletable file was not tested this way");
+            test::skipped("no file system can be mounted");
             return;
         }
         CHECK(told == NOTHING);

@@ -12,6 +12,7 @@
 #include <string>
 #include <vector>
 
+#include "support/skip.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
 
@@ -98,7 +99,7 @@ private:
         if (locale != nullptr)
             all_.push_back({name, path, locale});
         else
-            MESSAGE("not tested, as this machine lacks it: locale " << name);
+            skipped("there is no locale " + name);
     }
 
     TempDir directory_;

@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "support/failingmemory.h"
+#include "support/skip.h"
 #include "support/throws.h"
 #include "text/convert.h"
 
@@ -33,7 +34,7 @@ public:
         void* const memory = ::mmap(nullptr, size_ + PIECE, PROT_READ | PROT_WRITE,
                                     MAP_PRIVATE | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0);
         if (memory != MAP_FAILED) memory_ = static_cast<char*>(memory);
-        if (memory_ == nullptr) MESSAGE("not tested: the address space has no room for the text");
+        if (memory_ == nullptr) test::skipped("the address space has no room for the text");
         for (std::size_t at = 0; memory_ != nullptr && at < size_; at += PIECE) {
             REQUIRE(::mmap(memory_ + at, PIECE, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_FIXED,
                            file, 0) != MAP_FAILED);
@@ -59,7 +60,7 @@ private:
 /// Whether there can be text that is too long for a string.
 bool canBeTooLong() {
     if (sizeof(void*) == 4) return true;
-    MESSAGE("not tested: with 64 bits no memory holds a text too long for a string");
+    test::skipped("with 64 bits no memory holds a text too long for a string");
     return false;
 }
 
@@ -81,7 +82,7 @@ std::vector<std::size_t> sizesTooLong() {
     if (ADDRESS_SPACE_CAN_BE_LIMITED)
         sizes.push_back((std::size_t{1} << 31) / sizeof(Char));
     else
-        MESSAGE("not tested under a sanitizer: text of 2 GiB");
+        test::skipped("text of 2 GiB under a sanitizer");
     return sizes;
 }
 
