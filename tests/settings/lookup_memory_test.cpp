@@ -7,6 +7,7 @@
 #include <koru/propertyfile.h>
 
 #include "support/failingmemory.h"
+#include "support/plainlocale.h"
 #include "support/settingsfixture.h"
 
 using test::Failing;
@@ -31,6 +32,7 @@ std::string lines(int count) {
 } // namespace
 
 TEST_CASE("look-ups find what is there without any memory, and then with it") {
+    test::PlainLocale const locale; // In Turkish, "SECTION" would be another name.
     for (int const count : {1, 4, 5, 60, 300}) {
         CAPTURE(count);
         SettingsFile file("[section]\n" + lines(count));

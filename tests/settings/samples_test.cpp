@@ -15,6 +15,7 @@
 
 #include <koru/string.h>
 
+#include "support/plainlocale.h"
 #include "support/settingsfixture.h"
 #include "support/settingsmodel.h"
 #include "support/shown.h"
@@ -176,6 +177,7 @@ TEST_CASE("the samples have the traits that they are there for") {
 }
 
 TEST_CASE("every key line of a sample comes out as it is there") {
+    test::PlainLocale const locale;
     forEachSample(READ, [](Sample const& sample, SettingsFile& file) {
         CHECK(file.enumerateSections().size() == sample.sections);
         // Of equal entries the first of the file comes first; removing it uncovers the next.
@@ -193,6 +195,7 @@ TEST_CASE("every key line of a sample comes out as it is there") {
 }
 
 TEST_CASE("sections and keys of a sample are listed once per line, in order, as spelt") {
+    test::PlainLocale const locale;
     forEachSample(READ, [](Sample const& sample, SettingsFile& file) {
         // Section and key in lower case, then the number of the line, sort as the table does.
         std::map<std::wstring, std::multimap<std::wstring, Line>> sorted;
@@ -226,6 +229,7 @@ TEST_CASE("a sample that was written back reads the same, and is written the sam
 }
 
 TEST_CASE("changing one value of a sample leaves all others") {
+    test::PlainLocale const locale;
     forEachSample(READ_WRITE, [](Sample const& sample, SettingsFile& file) {
         Settings expected = sortedSettings(sample.bytes);
         Setting& changed = expected[expected.size() / 2];

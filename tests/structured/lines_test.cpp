@@ -9,6 +9,7 @@
 
 #include "structured/lines.h"
 #include "support/choices.h"
+#include "support/plainlocale.h"
 
 using namespace structured;
 using namespace std::string_literals;
@@ -234,6 +235,7 @@ SETTINGS_TEST_CASE("a missing key gives an empty value or no effect") {
 }
 
 SETTINGS_TEST_CASE("keys match without regard to case and in full") {
+    test::PlainLocale const locale;
     Lines<Family> file("Host=a\nHostname=b\nname =c\n");
     CHECK((file.get(L"hOST") == L"a"));
     CHECK((file.get(L"HOSTNAME") == L"b"));

@@ -9,6 +9,7 @@
 #include <doctest/doctest.h>
 
 #include <algorithm>
+#include <clocale>
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
@@ -37,6 +38,7 @@ public:
 
     void test_case_start(doctest::TestCaseData const& testCase) override {
         notes.testCase = testCase.m_name;
+        std::setlocale(LC_ALL, ""); // that of the environment, whatever the case before set
         subcases_ = 0;
         before_ = test::Possessions();
     }

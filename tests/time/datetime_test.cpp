@@ -212,6 +212,7 @@ TEST_CASE("a setter changes its field and nothing else") {
 }
 
 TEST_CASE("an offset is stored as given") {
+    Zone const zone("UTC");
     DateTime value(MARCH);
     for (short const offset : {short{-720}, short{-1}, short{0}, short{60}, short{840}}) {
         value.setOffset(offset);

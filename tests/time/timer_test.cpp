@@ -19,6 +19,7 @@
 #include <utility>
 
 #include "support/differences.h"
+#include "support/plainlocale.h"
 #include "support/streamprobe.h"
 
 using Koru::Timer;
@@ -278,6 +279,7 @@ TEST_CASE("near the epoch, where a float is finer, the decimals show") {
 }
 
 TEST_CASE("the time elapsed is the difference of two rounded floats for any two moments") {
+    test::PlainLocale const locale; // for the point that printf writes
     Random random(20231114);
     Differences differences;
     auto const near = [&random](std::uint32_t start, std::uint32_t seconds) {
