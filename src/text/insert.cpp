@@ -35,6 +35,8 @@ void _passThrough(std::ostream& os, char const* s, char const* last) {
     auto const setBad = [&os] { _setBad(os); };
     auto const catchUnlessAsked = [&os] {
         _setBad(os);
+        // `attempt` calls this in a handler.
+        // cppcheck-suppress rethrowNoCurrentException
         if ((os.exceptions() & std::ios::badbit) != 0) throw;
     };
     undoIfCancelled([&] { attempt(put, catchUnlessAsked); }, setBad);
