@@ -108,9 +108,11 @@ public:
     /// @throws std::invalid_argument "zero length key", as `setKey`
     Record(std::wstring const& key, std::vector<unsigned char> const& data);
 
+    /// @{
     /// Copies key and data.
     Record(Record const& other);
     Record& operator=(Record const& other);
+    /// @}
 
     /// Virtual, so that derived records can be deleted through a pointer to this class.
     virtual ~Record();

@@ -112,6 +112,7 @@ private:
     std::uint8_t parts_;
 };
 
+/// @{
 /// Compares the seconds since the epoch of both values; milliseconds, offset and parts do
 /// not count.
 KORU_EXPORT bool operator==(DateTime const& a, DateTime const& b);
@@ -120,6 +121,7 @@ KORU_EXPORT bool operator<(DateTime const& a, DateTime const& b);
 KORU_EXPORT bool operator<=(DateTime const& a, DateTime const& b);
 KORU_EXPORT bool operator>(DateTime const& a, DateTime const& b);
 KORU_EXPORT bool operator>=(DateTime const& a, DateTime const& b);
+/// @}
 
 /// Writes the text form.
 KORU_EXPORT std::ostream& operator<<(std::ostream& os, DateTime const& value);

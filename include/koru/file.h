@@ -159,6 +159,7 @@ public:
     /// All three parts empty.
     Path();
 
+    /// @{
     /// Parses a path. Text counts up to its first NUL, and narrow text is UTF-8.
     /// @throws std::invalid_argument "null or empty string passed as file path"
     /// @throws std::invalid_argument "cannot determine path" when no directory below the root
@@ -168,10 +169,13 @@ public:
     Path(wchar_t const* text);
     Path(std::string const& text);
     Path(char const* text);
+    /// @}
 
+    /// @{
     /// Copies all three parts.
     Path(Path const& other);
     Path& operator=(Path const& other);
+    /// @}
 
     /// Virtual, so that derived paths can be deleted through a pointer to this class.
     virtual ~Path();
@@ -205,9 +209,11 @@ private:
 /// Writes the path's wide string, each character as its low 8 bits.
 KORU_EXPORT std::ostream& operator<<(std::ostream& os, File::Path const& path);
 
+/// @{
 /// Intended: equality ignores case (`compare` of <koru/string.h>), although file systems do not.
 KORU_EXPORT bool operator==(File::Path const& a, File::Path const& b);
 KORU_EXPORT bool operator!=(File::Path const& a, File::Path const& b);
+/// @}
 
 } // namespace Koru
 

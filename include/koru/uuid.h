@@ -48,9 +48,11 @@ private:
     unsigned char bytes_[16];
 };
 
+/// @{
 /// Equal when all 16 bytes are.
 KORU_EXPORT bool operator==(Uuid const& a, Uuid const& b);
 KORU_EXPORT bool operator!=(Uuid const& a, Uuid const& b);
+/// @}
 
 /// Writes the text form.
 KORU_EXPORT std::ostream& operator<<(std::ostream& os, Uuid const& uuid);

@@ -3,11 +3,13 @@
 #ifndef KORU_VERSION_H
 #define KORU_VERSION_H
 
+/// @{
 /// The three parts of the version. Releases with the same first part keep every binary that was
 /// linked to one of them running; the second part grows when something is added.
 #define KORU_VERSION_MAJOR 1
 #define KORU_VERSION_MINOR 0
 #define KORU_VERSION_PATCH 0
+/// @}
 
 /// The version as one number, to compare: 1.2.3 is 10203.
 #define KORU_VERSION (KORU_VERSION_MAJOR * 10000 + KORU_VERSION_MINOR * 100 + KORU_VERSION_PATCH)
