@@ -216,6 +216,7 @@ extern "C" int fclose(FILE* stream) {
 }
 
 extern "C" int close(int fd) {
+    test::passCancellationPoint();
     int const result = test::realFunction<int (*)(int)>("close")(fd);
     return test::failsNow(test::Call::CLOSE) ? -1 : result;
 }
