@@ -9,8 +9,33 @@
 #include <sstream>
 #include <stdexcept>
 #include <string>
+#include <system_error>
 
 namespace test {
+
+/// Lets the owner into a directory again: File::remove shuts all but root out of one that it cannot
+/// delete.
+inline void letIn(std::filesystem::path const& directory) {
+    std::filesystem::permissions(directory, std::filesystem::perms::owner_all,
+                                 std::filesystem::perm_options::add);
+}
+
+/// Lets the owner into a directory and all below it.
+inline void letInEverywhere(std::filesystem::path const& directory) {
+    letIn(directory);
+    for (auto const& entry : std::filesystem::directory_iterator(directory)) {
+        if (!entry.is_symlink() && entry.is_directory()) letInEverywhere(entry.path());
+    }
+}
+
+/// Removes a directory with all its content, wherever its owner was shut out.
+inline void removeTree(std::filesystem::path const& directory) {
+    std::error_code failure;
+    std::filesystem::remove_all(directory, failure);
+    if (!failure) return;
+    letInEverywhere(directory);
+    std::filesystem::remove_all(directory);
+}
 
 /// Made on construction, removed with its content on destruction.
 class TempDir {
@@ -23,8 +48,10 @@ public:
     TempDir(TempDir const&) = delete;
     TempDir& operator=(TempDir const&) = delete;
     ~TempDir() {
-        std::error_code ignored;
-        std::filesystem::remove_all(path_, ignored);
+        try {
+            removeTree(path_);
+        } catch (std::filesystem::filesystem_error const&) { // A test has removed it.
+        }
     }
 
     /// The directory, without a slash at its end.

@@ -314,21 +314,27 @@ std::string contentOf(std::string const& path) {
     return address ? "<address>" : text;
 }
 
-/// Everything in a directory: names, permissions, contents and targets, in order.
+/// Adds a line for what is at a path and for everything below: name, permissions, content or target.
+void addState(std::filesystem::path const& path, std::string const& name,
+              std::set<std::string>& lines) {
+    if (std::filesystem::is_symlink(path)) {
+        lines.insert(name + " -> " + std::filesystem::read_symlink(path).string() + "\n");
+        return;
+    }
+    struct stat status = {};
+    REQUIRE(::stat(path.c_str(), &status) == 0);
+    std::string const line = name + " " + std::to_string(status.st_mode);
+    lines.insert(line + (S_ISREG(status.st_mode) ? " " + contentOf(path) : "") + "\n");
+    if (!S_ISDIR(status.st_mode)) return;
+    test::letIn(path);
+    for (auto const& entry : std::filesystem::directory_iterator(path))
+        addState(entry.path(), name + "/" + entry.path().filename().string(), lines);
+}
+
+/// Everything in a directory, in order.
 std::string stateOf(test::TempDir const& directory) {
     std::set<std::string> lines;
-    for (auto const& entry : std::filesystem::recursive_directory_iterator(directory.path())) {
-        std::string line = entry.path().string().substr(directory.path().size());
-        if (entry.is_symlink()) {
-            line += " -> " + std::filesystem::read_symlink(entry.path()).string();
-        } else {
-            struct stat status = {};
-            REQUIRE(::stat(entry.path().c_str(), &status) == 0);
-            line += " " + std::to_string(status.st_mode);
-            if (entry.is_regular_file()) line += " " + contentOf(entry.path());
-        }
-        lines.insert(line + "\n");
-    }
+    addState(directory.path(), "", lines);
     std::string state;
     for (std::string const& line : lines) state += line;
     return state;
