@@ -18,6 +18,7 @@
 
 #include "support/choices.h"
 #include "support/locales.h"
+#include "support/plainlocale.h"
 #include "support/settingsfixture.h"
 #include "support/settingsmodel.h"
 #include "support/skip.h"
@@ -293,6 +294,7 @@ TEST_CASE("random operations on tables of hundreds of entries agree with the mod
 }
 
 TEST_CASE("tables of every size up to two hundred find, miss and remove as the model does") {
+    test::PlainLocale const plain;
     for (std::size_t size = 0; size <= 200; ++size) {
         CAPTURE(size);
         Twins<> twins;
@@ -553,6 +555,7 @@ TEST_CASE("lookups agree with a scan by compare under the locale of the moment")
 }
 
 TEST_CASE("every character with a case is found as wcscasecmp finds it, in each locale") {
+    test::PlainLocale const plain;
     std::vector<std::wstring> keys;
     inEachLocale([&keys] {
         for (wint_t c = 0x80; c < 0x1F000; ++c) {
@@ -588,6 +591,7 @@ TEST_CASE("every character with a case is found as wcscasecmp finds it, in each 
 }
 
 TEST_CASE("a locale set between open and lookup counts at the lookup") {
+    test::PlainLocale const plain;
     std::string const previous = std::setlocale(LC_ALL, nullptr);
     REQUIRE(std::setlocale(LC_ALL, "C") != nullptr);
     SettingsFile file("[\xC3\x89t\xC3\xA9]\n\xC3\x85=lower comes first\n\xC3\xA5=second\n",
