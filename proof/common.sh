@@ -10,7 +10,8 @@ factor=${KORU_PROOF_FACTOR:-1}
 # Where a part keeps what it has done, as PART.ANYTHING.
 kept=${KORU_PROOF_KEPT:-$PWD/build/proof}
 mkdir -p "$kept"
-if [[ -f $rows ]]; then rm "$rows"; fi
+# Not where nothing is given: /dev/stdout may be a link to a file.
+if [[ $# -gt 0 && -f $rows ]]; then rm "$rows"; fi
 
 # figure WHAT RESULT: a row of the table.
 figure() { echo "| $1 | $2 | \`script/proof $part\` |" >>"$rows"; }

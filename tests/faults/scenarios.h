@@ -4,6 +4,7 @@
 #define KORU_TESTS_SCENARIOS_H
 
 #include <exception>
+#include <filesystem>
 #include <functional>
 #include <iterator>
 #include <string>
@@ -220,6 +221,35 @@ inline void addStructured(std::vector<Scenario>& scenarios, int entries, std::si
     addStructured<Sectioned>(scenarios, entries, size);
     addStructured<Flat>(scenarios, entries, size);
     addStructured<Records>(scenarios, entries, size);
+}
+
+/// All of them, with a value that is small, and one that is larger than any buffer.
+inline std::vector<Scenario> allScenarios() {
+    std::vector<Scenario> scenarios;
+    addStructured(scenarios, 1, 5);
+    addStructured(scenarios, 1, 20000);
+    addStreams(scenarios);
+    addWholeFiles(scenarios);
+    return scenarios;
+}
+
+/// What a scenario comes to.
+struct Result {
+    Report report;
+    std::string left;
+};
+
+/// What is wrong with a result under a fault, or nothing: to fail is allowed, silence is not.
+inline std::string complaintAbout(Result const& result, Result const& undisturbed) {
+    if (!result.report.succeeded) return "";
+    if (result.report.seen != undisturbed.report.seen) return "has read something else";
+    return result.left == undisturbed.left ? "" : "has left something else";
+}
+
+/// Including one for the folder itself.
+inline long openDescriptors() {
+    auto const all = std::filesystem::directory_iterator("/proc/self/fd");
+    return std::distance(begin(all), end(all));
 }
 
 } // namespace test

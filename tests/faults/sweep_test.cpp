@@ -7,8 +7,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
-#include <filesystem>
-#include <iterator>
 #include <string>
 #include <vector>
 
@@ -19,18 +17,13 @@
 using test::Call;
 using test::CALLS;
 using test::FailingCall;
+using test::openDescriptors;
 using test::Place;
-using test::Report;
+using test::Result;
 using test::Scenario;
 using test::ShortTransfers;
 
 namespace {
-
-/// What a scenario comes to.
-struct Result {
-    Report report;
-    std::string left;
-};
 
 template <class MakeFault>
 Result run(Scenario const& scenario, Place const& place, MakeFault makeFault) {
@@ -44,23 +37,8 @@ Result run(Scenario const& scenario, Place const& place, MakeFault makeFault) {
     return result;
 }
 
-/// With a value that is small, and one that is larger than any buffer.
-std::vector<Scenario> allScenarios() {
-    std::vector<Scenario> scenarios;
-    test::addStructured(scenarios, 1, 5);
-    test::addStructured(scenarios, 1, 20000);
-    test::addStreams(scenarios);
-    test::addWholeFiles(scenarios);
-    return scenarios;
-}
-
 Result runUndisturbed(Scenario const& scenario, Place const& place) {
     return run(scenario, place, [] { return 0; });
-}
-
-long openDescriptors() {
-    auto const all = std::filesystem::directory_iterator("/proc/self/fd");
-    return std::distance(begin(all), end(all));
 }
 
 /// Counts the calls of each kind that a scenario makes.
@@ -87,16 +65,14 @@ std::string complaintAbout(Scenario const& scenario, Result const& undisturbed, 
     Result const result =
         run(scenario, place, [&] { return FailingCall(call, error, before, times); });
     if (openDescriptors() != descriptors) return "leaves a descriptor open";
-    if (!result.report.succeeded) return "";
-    if (result.report.seen != undisturbed.report.seen) return "has read something else";
-    return result.left == undisturbed.left ? "" : "has left something else";
+    return test::complaintAbout(result, undisturbed);
 }
 
 } // namespace
 
 TEST_CASE("no fault of a system call is passed over in silence") {
     ::alarm(250); // A lock that is left held would not end.
-    std::vector<Scenario> const scenarios = allScenarios();
+    std::vector<Scenario> const scenarios = test::allScenarios();
     REQUIRE(scenarios.size() >= 25);
     long points = 0;
     for (Scenario const& scenario : scenarios) {
@@ -131,7 +107,7 @@ TEST_CASE("no fault of a system call is passed over in silence") {
 
 TEST_CASE("what is transferred in small pieces arrives whole") {
     ::alarm(250);
-    for (Scenario const& scenario : allScenarios()) {
+    for (Scenario const& scenario : test::allScenarios()) {
         Place const place;
         Result const undisturbed = runUndisturbed(scenario, place);
         for (std::size_t const bytes : {1U, 7U, 4096U}) {
