@@ -21,11 +21,12 @@
 
 #include "support/cancellation.h"
 #include "support/holder.h"
+#include "support/sanitizers.h"
 #include "support/script.h"
 #include "support/subprocess.h"
 #include "support/throws.h"
 
-#if defined(__SANITIZE_THREAD__)
+#if defined(KORU_THREAD_SANITIZER)
 // A copy of a held mutex is held without having been locked, and a held mutex may be assigned to
 // or destroyed: both are intended here, and the sanitizer would report them as mistakes. It still
 // looks for data races.

@@ -20,10 +20,11 @@
 #include "file/filefixture.h"
 #include "support/cancellation.h"
 #include "support/holder.h"
+#include "support/sanitizers.h"
 #include "support/sleeping.h"
 #include "support/subprocess.h"
 
-#if defined(__SANITIZE_THREAD__)
+#if defined(KORU_THREAD_SANITIZER)
 // A lock that is not held may be released, which the sanitizer would report as a mistake. It still
 // looks for data races.
 extern "C" char const* __tsan_default_options();

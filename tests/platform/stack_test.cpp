@@ -3,7 +3,9 @@
 // callers, and the frames of code with the address sanitizer have to be aligned.
 #include <doctest/doctest.h>
 
-#if defined(__i386__) && !defined(__SANITIZE_ADDRESS__)
+#include "support/sanitizers.h"
+
+#if defined(__i386__) && !defined(KORU_ADDRESS_SANITIZER)
 
 #include <sstream>
 #include <string>

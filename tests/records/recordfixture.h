@@ -27,6 +27,7 @@
 #include <koru/datafile.h>
 
 #include "support/ownfile.h"
+#include "support/sanitizers.h"
 #include "support/shown.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
@@ -257,11 +258,8 @@ inline std::size_t writeAndRead(Place const& place, Entries const& entries) {
     return inserted.size();
 }
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr bool MEMORY_CAN_BE_LIMITED = false; // the sanitizers reserve more than any limit allows
-#else
-constexpr bool MEMORY_CAN_BE_LIMITED = true;
-#endif
+// The sanitizers reserve more than any limit allows.
+constexpr bool MEMORY_CAN_BE_LIMITED = !test::SANITIZED;
 
 /// Gives this process 256 MiB more address space than it has now. Only for child processes.
 inline void limitMemory() {

@@ -4,7 +4,9 @@
 
 #include <pthread.h>
 
-#if defined(__SANITIZE_ADDRESS__)
+#include "support/sanitizers.h"
+
+#if defined(KORU_ADDRESS_SANITIZER)
 // The address sanitizer does not follow the unwinding of a cancelled thread and takes the frames it
 // has left for live ones. It trips over them itself where it asks for the signal stack.
 extern "C" inline __attribute__((used)) char const* __asan_default_suppressions() {

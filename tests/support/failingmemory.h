@@ -17,17 +17,15 @@
 #include <new>
 #include <string>
 
+#include "support/sanitizers.h"
+
 namespace test {
 
 // The address sanitizer takes far more of the address space than it uses, and it finds overruns
 // without our help.
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr bool ADDRESS_SPACE_CAN_BE_LIMITED = false;
-constexpr std::size_t BLOCK_HEAD = 0;
-#else
-constexpr bool ADDRESS_SPACE_CAN_BE_LIMITED = true;
-constexpr std::size_t BLOCK_HEAD = 16; // the size, and then the block as aligned as before
-#endif
+constexpr bool ADDRESS_SPACE_CAN_BE_LIMITED = !SANITIZED;
+// The size, and then the block as aligned as before.
+constexpr std::size_t BLOCK_HEAD = SANITIZED ? 0 : 16;
 
 enum class Failing { ONE, ONE_AND_ALL_LATER };
 

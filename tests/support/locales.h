@@ -12,11 +12,12 @@
 #include <string>
 #include <vector>
 
+#include "support/sanitizers.h"
 #include "support/skip.h"
 #include "support/subprocess.h"
 #include "support/tempdir.h"
 
-#if defined(__SANITIZE_ADDRESS__)
+#if defined(KORU_ADDRESS_SANITIZER)
 // Each newlocale of glibc that looks into LOCPATH keeps the list that it makes of it.
 // NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming)
 extern "C" inline __attribute__((used)) char const* __lsan_default_suppressions() {

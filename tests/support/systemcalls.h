@@ -18,6 +18,8 @@
 #include <cstddef>
 #include <cstdio>
 
+#include "support/sanitizers.h"
+
 namespace test {
 
 /// Kinds of calls. OPEN and CLOSE are those of streams and of descriptors.
@@ -59,11 +61,7 @@ inline thread_local long callsBeforeCancellation = -1;
 inline std::atomic<int> claimedSize{-1};
 
 // A sanitizer has a malloc of its own, in whose place no other can be put.
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr bool MALLOC_CAN_FAIL = false;
-#else
-constexpr bool MALLOC_CAN_FAIL = true;
-#endif
+constexpr bool MALLOC_CAN_FAIL = !SANITIZED;
 
 /// For how many of the streams that this thread opens next the C library gets no memory.
 inline thread_local int streamsWithoutMemory = 0;
@@ -259,7 +257,7 @@ extern "C" int truncate(char const* name, off_t size) noexcept {
     return test::realFunction<int (*)(char const*, off_t)>("truncate")(name, size);
 }
 
-#if !defined(__SANITIZE_ADDRESS__) && !defined(__SANITIZE_THREAD__)
+#if !defined(KORU_ADDRESS_SANITIZER) && !defined(KORU_THREAD_SANITIZER)
 // NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming)
 extern "C" void* __libc_malloc(size_t size);
 

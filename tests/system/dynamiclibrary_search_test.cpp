@@ -1,20 +1,18 @@
 // For whose sake the loader searches: it goes by who calls it, so nothing comes before its
-// functions here. This executable has a DT_RUNPATH that finds the libraries beside it.
+// functions here, which a sanitizer would. This executable has a DT_RUNPATH that finds the
+// libraries beside it.
 #include <koru/dynamiclibrary.h>
 
 #include <dlfcn.h>
 
 #include <doctest/doctest.h>
 
+#include "support/sanitizers.h"
+
 using Koru::DynamicLibrary;
+using test::SANITIZED;
 
 namespace {
-
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr bool SANITIZED = true; // The sanitizer calls the loader then.
-#else
-constexpr bool SANITIZED = false;
-#endif
 
 /// Whether this executable may load it.
 bool isFoundFromHere(char const* name) {

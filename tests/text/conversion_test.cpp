@@ -13,11 +13,12 @@
 #include <vector>
 
 #include "support/locales.h"
+#include "support/sanitizers.h"
 #include "text/convert.h"
 #include "text/textmodel.h"
 #include "text/utf8.h"
 
-#if defined(__SANITIZE_ADDRESS__)
+#if defined(KORU_ADDRESS_SANITIZER)
 // The allocator keeps what was freed of each size for long, and these texts are of very many sizes.
 // NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming)
 extern "C" __attribute__((used)) char const* __asan_default_options() {

@@ -14,9 +14,18 @@
 #include <vector>
 
 #include "support/failingmemory.h"
+#include "support/sanitizers.h"
 #include "support/skip.h"
 #include "support/throws.h"
 #include "text/convert.h"
+
+#if defined(KORU_ADDRESS_SANITIZER)
+// What the library exports is in this program a second time.
+// NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming)
+extern "C" __attribute__((used)) char const* __asan_default_options() {
+    return "detect_odr_violation=0";
+}
+#endif
 
 using namespace test;
 
