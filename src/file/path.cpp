@@ -134,7 +134,7 @@ File::Path::Path(std::wstring const& text) {
         end = path + resolved.size();
     }
     wchar_t const* name = end;
-    while (name != path && !_isSeparator(name[-1])) --name;
+    while (!_isSeparator(name[-1])) --name; // The first character is a separator.
     directory_ = _directory(path, name);
     // Intended: a file directly below the root cannot be represented.
     if (directory_.size() == 1) throw std::invalid_argument("cannot determine path");

@@ -39,10 +39,8 @@ inline std::string_view trim(std::string_view line) {
     return std::string_view(line.data() + first, last - first);
 }
 
-/// Whether a trimmed line is a comment.
-inline bool isComment(std::string_view line) {
-    return !line.empty() && (line.front() == '#' || line.front() == ';');
-}
+/// Whether a trimmed line, which is not empty, is a comment.
+inline bool isComment(std::string_view line) { return line.front() == '#' || line.front() == ';'; }
 
 /// Calls `parse(line, plain)` for every line that is neither empty nor a comment, trimmed; `plain`
 /// is what `isPlain` says of it.
