@@ -15,9 +15,12 @@ using Fingerprint = std::uint16_t;
 
 constexpr std::size_t NOT_FOUND = static_cast<std::size_t>(-1);
 
+/// Whether this machine has vectors of 32 bytes.
+inline bool hasWideVectors() { return __builtin_cpu_supports("avx2"); }
+
 /// The position of the first such number in a column, from a position on, or NOT_FOUND.
 std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint wanted,
-                            std::size_t from);
+                            std::size_t from, bool wideVectors = hasWideVectors());
 
 /// The same for the first of two numbers.
 std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint wanted,

@@ -176,7 +176,10 @@ TEST_CASE("a number is found first at its first place from any place on, in colu
                     return found == column.end() ? NOT_FOUND
                                                  : static_cast<std::size_t>(found - column.begin());
                 };
-                CHECK(findFingerprint(column, 2, from) == expect([](auto n) { return n == 2; }));
+                for (bool const wide : {false, Koru::hasWideVectors()}) {
+                    CHECK(findFingerprint(column, 2, from, wide) ==
+                          expect([](auto n) { return n == 2; }));
+                }
                 CHECK(findFingerprint(column, 3, 2, from) ==
                       expect([](auto n) { return n == 2 || n == 3; }));
             }
