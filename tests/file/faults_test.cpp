@@ -12,6 +12,7 @@
 #include <cstddef>
 #include <cstring>
 #include <filesystem>
+#include <fstream>
 #include <functional>
 #include <ios>
 #include <memory>
@@ -24,6 +25,7 @@
 
 #include "support/cancellation.h"
 #include "support/failingmemory.h"
+#include "support/holder.h"
 #include "support/structuredfile.h"
 #include "support/subprocess.h"
 #include "support/systemcalls.h"
@@ -51,6 +53,7 @@ unsigned long const READ_WRITE = READ | WRITE;
 int const COUNT = 1000; // entries, more than a stream reads at once
 
 char const* const NOT_OPENED = "failed to open file.";
+char const* const NOT_CLOSED = "failed to close file.";
 char const* const NOT_READ = "failed to read from file";
 
 template <class Callable>
@@ -118,7 +121,26 @@ void cancelAfterAWhile(pthread_t thread) {
     ::pthread_cancel(thread);
 }
 
+/// What std::filebuf::close does within the scope of an object: nothing.
+struct BuffersStayOpen {
+    BuffersStayOpen() { exist = true; }
+    BuffersStayOpen(BuffersStayOpen const&) = delete;
+    BuffersStayOpen& operator=(BuffersStayOpen const&) = delete;
+    ~BuffersStayOpen() { exist = false; }
+
+    static inline bool exist = false;
+};
+
 } // namespace
+
+// Under the name by which the library calls that of the standard library.
+#define KORU_FILEBUF_CLOSE "_ZNSt13basic_filebufIcSt11char_traitsIcEE5closeEv"
+extern "C" std::filebuf* closeBuffer(std::filebuf* buffer) __asm__(KORU_FILEBUF_CLOSE);
+
+extern "C" std::filebuf* closeBuffer(std::filebuf* buffer) {
+    auto const close = test::realFunction<std::filebuf* (*)(std::filebuf*)>(KORU_FILEBUF_CLOSE);
+    return BuffersStayOpen::exist ? nullptr : close(buffer);
+}
 
 TEST_CASE_FIXTURE(Place, "a file that cannot be opened for a passing reason is tried once and "
                          "keeps its content") {
@@ -203,12 +225,32 @@ TEST_CASE_TEMPLATE("close that cannot create the new file through a stream write
             {
                 auto const file = stored.changed();
                 FailingCall const fault(Call::OPEN, error, before);
+                FailingCall const createdLate(Call::DESCRIPTOR, EINTR);
                 FailingCall const interruption(Call::WRITE, EINTR); // is no end of the content
                 CHECK(complaint([&] { file->close(); }) == NOT_OPENED);
             }
             CHECK(stored.isNew());
         }
     });
+}
+
+TEST_CASE_TEMPLATE("a file whose buffer stays open stays as it was, and can be closed later",
+                   Family, Sectioned, Flat, Records) {
+    Stored<Family> const stored;
+    auto const file = stored.changed();
+    unsigned long const mode = file->getMode();
+    {
+        BuffersStayOpen const fault;
+        CHECK(complaint([&] { file->close(); }) == NOT_CLOSED);
+    }
+    CHECK(file->is_open());
+    CHECK(file->fail());
+    CHECK(file->getMode() == mode);
+    CHECK(stored.isOld());
+    { test::Holder<Koru::File> const otherThread(*file); } // The lock is free.
+    CHECK(test::sizeOf<Family>(*file) == COUNT + 1);
+    file->close();
+    CHECK(stored.isNew());
 }
 
 TEST_CASE_FIXTURE(Place, "a log that cannot be opened for a passing reason keeps its content") {

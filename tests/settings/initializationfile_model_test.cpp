@@ -352,7 +352,7 @@ TEST_CASE("in a table of six thousand entries every key is found and every other
 
 TEST_CASE("sections and keys that come and go by the thousand leave the table right") {
     std::string bytes;
-    for (int i = 0; i < 10; ++i) bytes += "[kept " + std::to_string(i) + "]\nk=v\n";
+    for (int i = 0; i < 10; ++i) bytes += "[kept " + std::to_string(i) + "]\nk=v\nl=w\n";
     Twins<> twins;
     twins.file.place.write(bytes);
     twins.file.open(READ_WRITE);

@@ -72,6 +72,19 @@ TEST_CASE("entries are removed where the memory for look-ups came late") {
     CHECK(file.enumerateKeys().empty());
 }
 
+TEST_CASE("what was set is removed without any memory, and can be set again") {
+    SettingsFile file("[s]\n" + lines(3));
+    std::wstring const section = L"s";
+    std::wstring const key = L"key1";
+    for (wchar_t const* const value : {L"set", L"set again"}) {
+        file.setValue(section, key, value);
+        CHECK((file.getValue(section, key) == value));
+        run(false, [&] { file.removeKey(section, key); });
+        CHECK(test::memoryRanOut());
+        test::checkSame(file.enumerateKeys(section), {L"key0", L"key2"});
+    }
+}
+
 TEST_CASE("a file of comments opens without the memory for as many entries") {
     std::string comments;
     while (comments.size() < 1000000) comments += "; a comment of the usual length\n";

@@ -5,6 +5,7 @@
 #define KORU_TESTS_SYSTEMCALLS_H
 
 #include <dlfcn.h>
+#include <fcntl.h>
 #include <pthread.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -22,9 +23,10 @@
 
 namespace test {
 
-/// Kinds of calls. OPEN and CLOSE are those of streams and of descriptors.
+/// Kinds of calls. OPEN is that of streams and DESCRIPTOR that of descriptors; CLOSE is both.
 enum class Call {
     OPEN,
+    DESCRIPTOR,
     READ,
     WRITE,
     SEEK,
@@ -38,9 +40,10 @@ enum class Call {
     TRUNCATE
 };
 
-constexpr std::array<Call, 12> CALLS = {Call::OPEN,   Call::READ,   Call::WRITE,   Call::SEEK,
-                                        Call::STATUS, Call::CLOSE,  Call::REMOVE,  Call::RENAME,
-                                        Call::CHMOD,  Call::ACCESS, Call::RESOLVE, Call::TRUNCATE};
+constexpr std::array<Call, 13> CALLS = {
+    Call::OPEN,   Call::DESCRIPTOR, Call::READ,    Call::WRITE,  Call::SEEK,
+    Call::STATUS, Call::CLOSE,      Call::REMOVE,  Call::RENAME, Call::CHMOD,
+    Call::ACCESS, Call::RESOLVE,    Call::TRUNCATE};
 
 /// What the calls of one kind do besides their work.
 struct CallPlan {
@@ -159,6 +162,16 @@ extern "C" FILE* fopen(char const* name, char const* mode) {
 
 extern "C" FILE* fopen64(char const* name, char const* mode) {
     return test::openStream("fopen64", name, mode);
+}
+
+extern "C" int open(char const* name, int flags, ...) {
+    test::passCancellationPoint();
+    if (test::failsNow(test::Call::DESCRIPTOR)) return -1;
+    va_list arguments;
+    va_start(arguments, flags);
+    mode_t const mode = (flags & O_CREAT) != 0 ? va_arg(arguments, mode_t) : 0;
+    va_end(arguments);
+    return test::realFunction<int (*)(char const*, int, ...)>("open")(name, flags, mode);
 }
 
 extern "C" ssize_t read(int fd, void* buffer, size_t count) {

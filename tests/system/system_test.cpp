@@ -230,6 +230,8 @@ TEST_CASE("an entry without an official name has an address") {
 TEST_CASE("an entry without addresses has an official name") {
     Host const host("official.example", {});
     CHECK(answers() == "answered|official.example|");
+    host.entry->h_addr_list = nullptr;
+    CHECK(answers() == "answered|official.example|");
 }
 
 TEST_CASE("of several addresses the first counts, in dotted decimal") {

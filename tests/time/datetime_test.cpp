@@ -365,6 +365,14 @@ TEST_CASE("the offset is the difference to mktime of gmtime, divided towards zer
     }
 }
 
+TEST_CASE("the offset is 0 where the C library has no date in UTC") {
+    Zone const zone("IST-5:30");
+    Calls calls;
+    calls.gmtimeFails = true;
+    CHECK(shown(DateTime(MARCH, BOTH)) == "2005/3/7 14:35:0.0 offset 0 parts 3");
+    CHECK(calls.gmtime == std::vector<std::time_t>{MARCH});
+}
+
 TEST_CASE_TEMPLATE("a conversion costs mktime once, and with a time of day gmtime and mktime", From,
                    FromBrokenDown, FromSeconds, FromTimeval) {
     bool const isBrokenDown = std::is_same<From, FromBrokenDown>::value;

@@ -40,6 +40,7 @@ struct Calls {
     std::vector<std::time_t> gmtime;
     std::vector<std::time_t> localtime;
     std::deque<std::time_t> mktimeAnswers; ///< else the C library's own
+    bool gmtimeFails = false;
     bool localtimeFails = false;
 };
 
@@ -74,7 +75,8 @@ extern "C" std::time_t mktime(std::tm* time) noexcept {
 extern "C" std::tm* gmtime(std::time_t const* moment) noexcept {
     static auto* const real = test::next<std::tm*(std::time_t const*)>("gmtime");
     if (test::Calls::active != nullptr) test::Calls::active->gmtime.push_back(*moment);
-    return real(moment);
+    return test::Calls::active != nullptr && test::Calls::active->gmtimeFails ? nullptr
+                                                                              : real(moment);
 }
 
 extern "C" std::tm* localtime(std::time_t const* moment) noexcept {
