@@ -5,7 +5,7 @@
 
 using Koru::File;
 
-// File::copy makes an empty target and copies nothing. This copies the bytes.
+// File::copy copies no content; it writes the text of a pointer to the target. This copies the bytes.
 bool copyBytes(File::Path const& from, File::Path const& to) {
     File source(from);
     File target(to);
