@@ -10,5 +10,5 @@ int main() {
     Koru::File::Path const program(System::getProcessFileName());
     std::cout << Koru::make_string(program.getName()).c_str() << '\n';
     std::cout << std::boolalpha << System::existsFile(program) << '\n';
-    std::cout << !System::getIpHostName().empty() << '\n';
+    std::cout << !System::getName().empty() << '\n'; // the host's own name for itself
 }
