@@ -10,6 +10,8 @@
 #include <cstddef>
 #include <string>
 
+#include "support/sanitizers.h"
+
 namespace test {
 
 /// The entries of a folder of /proc, less the two of every folder.
@@ -26,7 +28,7 @@ inline long entriesOf(char const* folder) {
 /// allocations, and what further arenas take, unless GLIBC_TUNABLES forbids both with
 /// glibc.malloc.tcache_count=0:glibc.malloc.arena_max=1.
 inline std::size_t heldBytes() {
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+#if defined(KORU_ADDRESS_SANITIZER) || defined(KORU_THREAD_SANITIZER)
     return 0; // A sanitizer has a malloc of its own.
 #else
     // The loader keeps its latest complaint until it is asked for the next one.

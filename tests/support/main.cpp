@@ -16,8 +16,10 @@
 #include <cstdlib>
 #include <cstring>
 #include <string>
+#include <thread>
 
 #include "support/leftovers.h"
+#include "support/sanitizers.h"
 #include "support/selfexec.h"
 #include "support/skip.h"
 
@@ -78,6 +80,9 @@ int codeOfSkipped() {
 }
 
 int runTests(int argc, char** argv) {
+#if defined(KORU_THREAD_SANITIZER)
+    std::thread([] {}).join(); // With the first thread, the sanitizer starts one of its own.
+#endif
     doctest::Context context(argc, argv);
     int failed = context.run();
     auto const isTwice = [](char const* argument) { return std::strcmp(argument, "--twice") == 0; };
