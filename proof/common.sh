@@ -15,3 +15,8 @@ if [[ $# -gt 0 && -f $rows ]]; then rm "$rows"; fi
 
 # figure WHAT RESULT: a row of the table.
 figure() { echo "| $1 | $2 | \`script/proof $part\` |" >>"$rows"; }
+
+# testPrograms ARGUMENT OF ctest...: the names of the test programs in build/i386-dev, one a line.
+testPrograms() {
+    ctest --test-dir build/i386-dev --show-only "$@" | sed -nE 's/^ +Test +#[0-9]+: +(\w+_test)$/\1/p'
+}

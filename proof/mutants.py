@@ -2,8 +2,8 @@
 """Changes the library's sources in one place at a time and sees whether the tests notice.
 
 A mutant is one small fault put into one line of src/ in a copy of the tree: a flipped comparison, a
-number that is off by one, a dropped statement, a swapped operator. The tests of the folder it is in
-run then, the slow ones last. Those that no test notices are printed; where nothing a caller can
+number that is off by one, a dropped statement, a swapped operator. Then the tests of its folder run,
+the slow ones last. Those that no test notices are printed; where nothing a caller can
 see has changed, proof/equivalent-mutants.tsv says why, and they are not counted.
 
 Tests run as root in a view of the machine in which only the copy and /tmp can be written, for a
