@@ -56,6 +56,9 @@ void checkSame(DataFile& file, Entries expected) {
     std::sort(held.begin(), held.end());
     std::sort(expected.begin(), expected.end());
     KORU_CHECK(held == expected);
+}
+
+void checkEnd(DataFile& file) {
     try {
         static_cast<void>(file[file.size()]);
         KORU_CHECK(false);
@@ -110,6 +113,7 @@ extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size
     file.open(File::READ | File::WRITE);
     Entries entries;
     while (!input.isAtEnd()) callOne(input, file, entries);
+    checkEnd(file);
     file.close();
     checkSame(file, {});
     file.open(File::READ);
