@@ -218,6 +218,7 @@ TEST_CASE_TEMPLATE("synchronize that cannot open the file again has written it w
 TEST_CASE_TEMPLATE("close that cannot create the new file through a stream writes it without one",
                    Family, Sectioned, Flat, Records) {
     Stored<Family> const stored;
+    mode_t const mask = ::umask(0);
     forPassingReasons([&](int error) {
         for (long const before : {0L, 1L}) {
             CAPTURE(before);
@@ -230,8 +231,12 @@ TEST_CASE_TEMPLATE("close that cannot create the new file through a stream write
                 CHECK(complaint([&] { file->close(); }) == NOT_OPENED);
             }
             CHECK(stored.isNew());
+            struct stat status = {};
+            CHECK(::stat(stored.path.c_str(), &status) == 0);
+            CHECK((status.st_mode & 07777U) == 0666U); // as a stream creates it
         }
     });
+    ::umask(mask);
 }
 
 TEST_CASE_TEMPLATE("a file whose buffer stays open stays as it was, and can be closed later",
@@ -484,6 +489,20 @@ TEST_CASE_TEMPLATE("a size that the system claims is only a guess", Family, Sect
         test::claimedSize = -1;
         CHECK(test::sizeOf<Family>(file) == count);
     }
+}
+
+TEST_CASE_TEMPLATE("memory is taken for the bytes that arrive, not for the size that is claimed",
+                   Family, Sectioned, Flat) {
+    Stored<Family> const stored(1);
+    typename Family::File file(stored.path);
+    test::claimedSize = 0x7FFFFFFF;
+    {
+        test::FailingMemory const none({0, Failing::ONE_AND_ALL_LATER, 2 * 1024 * 1024});
+        file.open(READ);
+    }
+    test::claimedSize = -1;
+    CHECK(!memoryRanOut());
+    CHECK(test::sizeOf<Family>(file) == 1);
 }
 
 TEST_CASE_TEMPLATE("a log that runs out of memory while it is opened is closed and can be opened "
