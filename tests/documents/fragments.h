@@ -6,6 +6,7 @@
 #include <cxxabi.h>
 
 #include <chrono>
+#include <clocale>
 #include <iostream>
 #include <string>
 
