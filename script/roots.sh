@@ -63,10 +63,20 @@ makeBase() {
     touch "$base.made"
 }
 
-# A copy of the bare system.
-copyBase() { # ROOT
-    discard "$1"
-    cp -a --reflink=auto "$roots/base" "$1"
+# Makes one root of another by a command in it, unless that has been done since the base was made and
+# the file was changed.
+derive() { # LABEL FROM TO FILE COMMAND...
+    local label=$1 to=$roots/$3 file=$4
+    if [[ $to.made -nt $roots/base.made && $to.made -nt $file ]]; then return; fi
+    rm -f "$to.made"
+    copyRoot "$2" "$3"
+    step "root: $label" enter "$to" "${@:5}"
+    touch "$to.made"
+}
+
+copyRoot() { # FROM TO
+    discard "$roots/$2"
+    cp -a --reflink=auto "$roots/$1" "$roots/$2"
 }
 
 # The project's files as git knows them, in a folder for someone who is not root in there.
