@@ -1,0 +1,35 @@
+// How files are opened: for reading, which changes nothing, or for a change that is saved safely.
+#ifndef KORU_TOOLS_ACCESS_H
+#define KORU_TOOLS_ACCESS_H
+
+#include <filesystem>
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "table.h"
+
+namespace tool {
+
+/// The path for the library, which takes it as it is. A parsed path could be no file directly below
+/// the root and none with a backslash in its name.
+Koru::File::Path verbatim(std::filesystem::path const& path);
+
+/// What is in a file, which counts from the working directory. Creates and changes nothing.
+std::vector<Entry> read(Family const& family, std::string const& file);
+
+/// What a change may do besides.
+struct Permission {
+    bool isToCreate; ///< the file, if it is missing
+    bool isToLose;   ///< lines that the library does not understand, or would write otherwise
+};
+
+/// Changes a file, or what a link leads to, so that it is the old one or the new one at any time:
+/// `action` changes a copy, which takes the file's place in one step. A file that would hold the
+/// same entries afterwards is left alone.
+void change(Family const& family, std::string const& file, Permission permission,
+            std::function<void(Table&)> const& action);
+
+} // namespace tool
+
+#endif
