@@ -25,7 +25,7 @@ namespace {
 
 int const MAX_LINKS = 40; // as many as the kernel follows
 
-void _fail(int error) { throw std::system_error(error, std::generic_category()); }
+[[noreturn]] void _fail(int error) { throw std::system_error(error, std::generic_category()); }
 
 /// Where the links lead; a link that leads nowhere names the file that is to be created.
 fs::path _withoutLinks(fs::path path) {
@@ -40,11 +40,9 @@ void _open(Table& table, unsigned long mode) {
     errno = 0;
     try {
         table.file().open(mode);
-    } catch (std::runtime_error const& e) {
-        int const error = errno;
-        table.file().setMode(0); // so that nothing is written back
-        if (error != 0) _fail(error);
-        throw;
+    } catch (std::runtime_error const&) {
+        if (errno != 0) _fail(errno);
+        throw; // The system is not to blame.
     }
 }
 
@@ -115,19 +113,25 @@ void _refuseLoss(Family const& family, fs::path const& path) {
     }
 }
 
-/// Changes the file itself, which is nobody else's yet. False if that left everything as it was.
-bool _rewrite(Family const& family, fs::path const& path,
-              std::function<void(Table&)> const& action) {
+/// Changes the file itself, which is nobody else's yet. Returns what is in it then.
+std::vector<Entry> _rewrite(Family const& family, fs::path const& path,
+                            std::function<void(Table&)> const& action) {
     auto const table = family.make(verbatim(path));
     _open(*table, File::READ | File::WRITE);
-    std::vector<Entry> const before = _sorted(table->entries());
     action(*table);
-    std::vector<Entry> const after = _sorted(table->entries());
+    std::vector<Entry> entries = _sorted(table->entries());
     table->file().close();
     if (table->file().fail()) throw Failure(FAILED, "failed to close the new file");
-    if (_sorted(_read(family, path)) != after)
+    if (_sorted(_read(family, path)) != entries)
         throw Failure(REFUSED, "it would not be read as it was set");
-    return after != before;
+    return entries;
+}
+
+/// Copies what the change begins with.
+void _copy(Family const& family, fs::path const& path, fs::path const& fresh, Options options) {
+    if (options.isToReplace) return;
+    fs::copy_file(path, fresh);
+    if (!options.mayLose) _refuseLoss(family, fresh);
 }
 
 /// Gives the new file the owner and the permissions of the old one; another owner where only root
@@ -166,18 +170,17 @@ std::vector<Entry> read(Family const& family, std::string const& file) {
     return _read(family, fs::absolute(file));
 }
 
-void change(Family const& family, std::string const& file, Permission permission,
+void change(Family const& family, std::string const& file, Options options,
             std::function<void(Table&)> const& action) {
     fs::path const path = _withoutLinks(fs::absolute(file));
     FolderLock const lock(path.parent_path());
     bool const isThere = _isThere(path);
-    if (!isThere && !permission.isToCreate) _fail(ENOENT);
+    if (!isThere && !options.mayCreate) _fail(ENOENT);
     Workshop const workshop(path.parent_path());
     fs::path const fresh = workshop.path() / path.filename();
-    if (isThere) fs::copy_file(path, fresh);
-    if (isThere && !permission.isToLose) _refuseLoss(family, fresh);
-    bool const hasChanged = _rewrite(family, fresh, action);
-    if (isThere && !hasChanged) return;
+    if (isThere) _copy(family, path, fresh, options);
+    std::vector<Entry> const entries = _rewrite(family, fresh, action);
+    if (isThere && entries == _sorted(_read(family, path))) return;
     if (isThere) _takeOver(path, fresh);
     _synchronize(fresh);
     if (!File::rename(wide(fresh.string()), wide(path.string())))

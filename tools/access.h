@@ -18,16 +18,17 @@ Koru::File::Path verbatim(std::filesystem::path const& path);
 /// What is in a file, which counts from the working directory. Creates and changes nothing.
 std::vector<Entry> read(Family const& family, std::string const& file);
 
-/// What a change may do besides.
-struct Permission {
-    bool isToCreate; ///< the file, if it is missing
-    bool isToLose;   ///< lines that the library does not understand, or would write otherwise
+/// What a change may do, or does, besides.
+struct Options {
+    bool mayCreate = false;   ///< the file, if it is missing
+    bool mayLose = false;     ///< lines that the library ignores, or would write otherwise
+    bool isToReplace = false; ///< the change begins with an empty table
 };
 
 /// Changes a file, or what a link leads to, so that it is the old one or the new one at any time:
 /// `action` changes a copy, which takes the file's place in one step. A file that would hold the
 /// same entries afterwards is left alone.
-void change(Family const& family, std::string const& file, Permission permission,
+void change(Family const& family, std::string const& file, Options options,
             std::function<void(Table&)> const& action);
 
 } // namespace tool

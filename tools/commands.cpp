@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <iostream>
 
-#include "access.h"
 #include "print.h"
 #include "text.h"
 
@@ -57,6 +56,12 @@ Entry _name(Arguments const& arguments) {
     return {arguments.section.value_or(""), arguments.key.value_or(""), ""};
 }
 
+Options _creating(Arguments const& arguments) {
+    Options options = arguments.options;
+    options.mayCreate = true;
+    return options;
+}
+
 /// A value that is not among the arguments is in standard input, there as a line.
 std::string _value(Arguments const& arguments) {
     if (arguments.value) return arguments.isRaw ? _digits(*arguments.value) : *arguments.value;
@@ -90,13 +95,12 @@ void set(Family const& family, Arguments const& arguments) {
     Entry entry = _name(arguments);
     entry.value = _value(arguments);
     family.check(entry);
-    change(family, arguments.file, {true, arguments.isToLose},
-           [&](Table& table) { table.set(entry); });
+    change(family, arguments.file, _creating(arguments), [&](Table& table) { table.set(entry); });
 }
 
 void remove(Family const& family, Arguments const& arguments) {
     Entry const name = _name(arguments);
-    change(family, arguments.file, {false, arguments.isToLose}, [&](Table& table) {
+    change(family, arguments.file, arguments.options, [&](Table& table) {
         if (arguments.key)
             (void)_find(family, table.entries(), name);
         else
@@ -111,10 +115,7 @@ void importFrom(Family const& family, Arguments const& arguments) {
         for (Entry const& entry : parsed) family.check(entry);
         return parsed;
     });
-    change(family, arguments.file, {true, arguments.isToLose}, [&](Table& table) {
-        if (arguments.isToReplace) {
-            for (Entry const& entry : table.entries()) table.remove(entry);
-        }
+    change(family, arguments.file, _creating(arguments), [&](Table& table) {
         for (Entry const& entry : entries) table.set(entry);
     });
 }

@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "access.h"
 #include "failure.h"
 #include "table.h"
 
@@ -21,8 +22,7 @@ struct Arguments {
     std::optional<std::string> value;
     std::string format = "text"; ///< or "json"
     std::string input = "-";     ///< of `import`
-    bool isToReplace = false;    ///< of `import`: what is there before goes
-    bool isToLose = false;       ///< changes a file although a save loses more than comments
+    Options options;             ///< of what changes a file
     bool isRaw = false;          ///< of records: data are bytes, not digits
     std::string program;         ///< of `path`
 };

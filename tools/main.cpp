@@ -15,10 +15,9 @@ namespace {
 
 using Command = void (*)(Family const&, Arguments const&);
 
-char const* const EXIT_CODES =
-    "Exit codes: 0 done; 1 not found, or lint has found something; 2 wrong arguments, or text "
-    "that\n"
-    "the file would not give back; 3 a file could not be read or written.";
+char const* const EXIT_CODES = "Exit codes: 0 done; 1 not found, or lint has found something;\n"
+                               "2 wrong arguments, or text that the file would not give back;\n"
+                               "3 a file could not be read or written.";
 
 /// What the program understands. The callbacks carry the commands out while it is parsed.
 class CommandLine {
@@ -89,7 +88,7 @@ private:
 
     void addForce(Family const& family, CLI::App* sub) {
         if (family.text == &family)
-            sub->add_flag("--force", arguments_.isToLose,
+            sub->add_flag("--force", arguments_.options.mayLose,
                           "Save although that loses lines of which lint tells");
     }
 
@@ -139,7 +138,8 @@ private:
         CLI::App* const sub =
             add(parent, family, "import", "Set what an export has written", importFrom);
         sub->add_option("INPUT", arguments_.input, "The export; without it, standard input");
-        sub->add_flag("--replace", arguments_.isToReplace, "Remove what the file has before");
+        sub->add_flag("--replace", arguments_.options.isToReplace,
+                      "Remove what the file has before");
         addFormat(sub);
         addForce(family, sub);
     }
@@ -180,6 +180,7 @@ int _complain(Failure const& failure) {
 } // namespace
 
 int run(int argc, char** argv) {
+    std::ios::sync_with_stdio(false); // so that standard input tells when it cannot be read
     try {
         return CommandLine().parse(argc, argv);
     } catch (...) {

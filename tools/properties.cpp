@@ -1,5 +1,6 @@
 // Property files: settings without sections.
 #include <koru/propertyfile.h>
+#include <koru/string.h>
 
 #include "storable.h"
 #include "table.h"
@@ -26,8 +27,9 @@ public:
 
     void remove(Entry const& name) override {
         std::wstring const key = wide(name.key);
-        std::size_t const count = file_.enumerateKeys().size();
-        for (std::size_t i = 0; i < count; ++i) file_.removeKey(key); // duplicates too
+        for (std::wstring const& other : file_.enumerateKeys()) {
+            if (Koru::compare(other, key) == 0) file_.removeKey(key);
+        }
     }
 
 private:

@@ -32,8 +32,10 @@ public:
 
     std::vector<Entry> entries() override {
         std::vector<Entry> result;
-        for (unsigned long i = 0; i < file_.size(); ++i)
-            result.push_back({"", _shown(file_[i].getKey()), hex(file_[i].getData())});
+        for (unsigned long i = 0; i < file_.size(); ++i) {
+            Koru::DataFile::Record const& record = file_[i];
+            result.push_back({"", _shown(record.getKey()), hex(record.getData())});
+        }
         return result;
     }
 

@@ -1,5 +1,6 @@
 // Settings files with sections.
 #include <koru/initializationfile.h>
+#include <koru/string.h>
 
 #include "storable.h"
 #include "table.h"
@@ -32,15 +33,19 @@ public:
 
     void remove(Entry const& name) override {
         std::wstring const section = wide(name.section);
-        // The library passes over every other entry of a section.
-        while (name.key.empty() && !file_.enumerateKeys(section).empty())
-            file_.removeSection(section);
+        if (name.key.empty()) return removeSection(section);
         std::wstring const key = wide(name.key);
-        std::size_t const count = file_.enumerateKeys(section).size();
-        for (std::size_t i = 0; i < count; ++i) file_.removeKey(section, key); // duplicates too
+        for (std::wstring const& other : file_.enumerateKeys(section)) {
+            if (Koru::compare(other, key) == 0) file_.removeKey(section, key);
+        }
     }
 
 private:
+    // The library passes over every other entry.
+    void removeSection(std::wstring const& section) {
+        while (!file_.enumerateKeys(section).empty()) file_.removeSection(section);
+    }
+
     Koru::InitializationFile file_;
 };
 

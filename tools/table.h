@@ -43,7 +43,7 @@ public:
     virtual std::vector<Entry> entries() = 0;
     /// Sets the value, for a name that is there too.
     virtual void set(Entry const& entry) = 0;
-    /// Removes all that has the entry's name; without a key, the whole section.
+    /// Removes all that has the entry's name, duplicates too; without a key, the whole section.
     virtual void remove(Entry const& name) = 0;
 };
 

@@ -5,6 +5,7 @@
 #include <nlohmann/json.hpp>
 
 #include <fstream>
+#include <iostream>
 #include <iterator>
 
 #include "failure.h"
@@ -70,10 +71,12 @@ std::vector<unsigned char> unhex(std::string const& digits) {
 }
 
 std::string readAll(std::string const& file) {
-    std::ifstream in(file == "-" ? "/dev/stdin" : file, std::ios::binary);
-    if (!in) failBySystem("cannot open it");
     // Unlike the stream's own operations the iterator lets the exception of a failure through.
-    return {std::istreambuf_iterator<char>(in), {}};
+    using Iterator = std::istreambuf_iterator<char>;
+    if (file == "-") return {Iterator(std::cin), {}};
+    std::ifstream in(file, std::ios::binary);
+    if (!in) failBySystem("cannot open it");
+    return {Iterator(in), {}};
 }
 
 } // namespace tool
