@@ -1,4 +1,5 @@
-// What helps those who type: the manual page and the completion of bash know what the program knows.
+// What helps those who type: the manual page, the completion of bash and docs/tool.md tell what the
+// program does.
 #include <doctest/doctest.h>
 
 #include <cctype>
@@ -29,21 +30,24 @@ Names namesIn(std::string const& help, std::string const& chapter) {
     return result;
 }
 
-/// All commands with the arguments that lead to them: {}, {"settings"}, {"settings", "list"}...
-std::vector<Words> commands(Desk const& desk, Words const& above = {}) {
-    std::vector<Words> result = {above};
-    Words words = above;
-    words.push_back("--help");
-    for (std::string const& name : namesIn(desk.output(words), "Subcommands")) {
-        words.back() = name;
-        for (Words const& below : commands(desk, words)) result.push_back(below);
+/// A command as its help shows it: {"settings", "list"}, say, or the program itself.
+struct Command {
+    Words words;
+    Names subcommands;
+    Names options;
+};
+
+/// The command and all below it.
+std::vector<Command> commands(Desk const& desk, Words const& words = {}) {
+    Words help = words;
+    help.push_back("--help");
+    std::string const text = desk.output(help);
+    std::vector<Command> result = {{words, namesIn(text, "Subcommands"), namesIn(text, "Options")}};
+    for (std::string const& name : Names(result[0].subcommands)) {
+        help.back() = name;
+        for (Command const& below : commands(desk, help)) result.push_back(below);
     }
     return result;
-}
-
-Names optionsOf(Desk const& desk, Words words) {
-    words.push_back("--help");
-    return namesIn(desk.output(words), "Options");
 }
 
 /// What bash offers for the last of the words.
@@ -66,35 +70,28 @@ Names offered(Desk const& desk, Words const& words) {
 
 } // namespace
 
-TEST_CASE("the manual page names every command and option of the help") {
+TEST_CASE("the manual page and the completion know the commands and options of the help") {
     Desk const desk;
     std::string const manual = test::readFile(KORU_MANUAL);
     auto const has = [&](std::string const& text) {
         return manual.find(text) != std::string::npos;
     };
-    std::vector<Words> const all = commands(desk);
+    std::vector<Command> const all = commands(desk);
     CHECK(all.size() == 26);
-    for (Words const& command : all) {
-        std::string const name = command.empty() ? "" : command.back();
+    for (Command const& command : all) {
+        std::string const name = command.words.empty() ? "settings" : command.words.back();
         CAPTURE(name);
-        CHECK((name.empty() || has("\n.It Cm " + name + "\n") || has("\n.Cm " + name + " ")));
-        for (std::string const& option : optionsOf(desk, command)) {
+        CHECK((has("\n.It Cm " + name + "\n") || has("\n.Cm " + name + " ")));
+        for (std::string const& option : command.options) {
             CAPTURE(option);
-            CHECK((has("\n.It Fl " + option.substr(1)) || has("\n.It Fl h , " + option.substr(1))));
+            std::string const macro = option.substr(1); // of two hyphens the page has one
+            CHECK((has("\n.It Fl " + macro) || has("\n.It Fl h , " + macro)));
         }
-    }
-}
-
-TEST_CASE("bash completes the commands and options of the help") {
-    Desk const desk;
-    for (Words const& command : commands(desk)) {
-        Words words = command;
-        words.push_back("--help");
-        Names const subcommands = namesIn(desk.output(words), "Subcommands");
+        Words words = command.words;
+        words.push_back("-");
+        CHECK(offered(desk, words) == command.options);
         words.back() = "";
-        if (!subcommands.empty()) CHECK(offered(desk, words) == subcommands);
-        words.back() = "-";
-        CHECK(offered(desk, words) == optionsOf(desk, command));
+        if (!command.subcommands.empty()) CHECK(offered(desk, words) == command.subcommands);
     }
 }
 
@@ -114,4 +111,35 @@ TEST_CASE("bash completes formats, sections and keys") {
     CHECK(offered(desk, {"settings", "get", ""}).empty()); // the names of files, by bash itself
     CHECK(offered(desk, {"properties", "get", "a\\ b.ini", "xx"}) == Names{"xx"});
     CHECK(offered(desk, {"properties", "get", "none", ""}).empty());
+}
+
+namespace {
+
+/// The blocks of a document that show sessions.
+std::string sessions(std::string const& document) {
+    std::istringstream in(test::readFile(document));
+    std::string result;
+    bool isInside = false;
+    for (std::string line; std::getline(in, line);) {
+        if (line.rfind("```", 0) == 0)
+            isInside = line == "```console";
+        else if (isInside)
+            result += line + "\n";
+    }
+    return result;
+}
+
+} // namespace
+
+TEST_CASE("the sessions of docs/tool.md go as they are shown") {
+    Desk const desk;
+    std::string const shown = sessions(KORU_TOOL_DOCUMENT);
+    std::istringstream in(shown);
+    std::string script = "exec 2>&1\nPATH=$(dirname '" KORU_TOOL "'):$PATH\n";
+    for (std::string line; std::getline(in, line);) {
+        if (line.rfind("$ ", 0) != 0) continue;
+        script += "cat <<'END'\n" + line + "\nEND\n" + line.substr(2) + "\n";
+    }
+    desk.write("script", script);
+    CHECK(test::execute("/bin/bash", {"bash", "script"}, desk.path()).out == shown);
 }
