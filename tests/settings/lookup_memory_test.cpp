@@ -98,3 +98,19 @@ TEST_CASE("a file of comments opens without the memory for as many entries") {
     CHECK(test::failedAllocations() == 1);
     CHECK((file.getValue(L"s", L"k") == L"v"));
 }
+
+TEST_CASE("sections, keys and values that come and go leave no memory behind" *
+          doctest::skip(test::SANITIZED)) {
+    SettingsFile file("[s]\nk=v\n");
+    auto const comeAndGo = [&file](int times) {
+        test::MostBytes const most;
+        for (int i = 0; i < times; ++i) {
+            std::wstring const section(100, static_cast<wchar_t>(L'a' + i % 26));
+            file.setValue(section + std::to_wstring(i), section, section);
+            file.removeSection(section + std::to_wstring(i));
+        }
+        return most.count();
+    };
+    comeAndGo(1000);
+    CHECK(comeAndGo(10000) < 100000);
+}
