@@ -103,16 +103,6 @@ std::vector<Entry> _read(Family const& family, fs::path const& path) {
     return table->entries();
 }
 
-/// A save would lose or garble such a file, although nobody has asked for that.
-void _refuseLoss(Family const& family, fs::path const& path) {
-    if (family.text != &family) return; // It is no text.
-    for (Finding const& finding : lint(readAll(path), family.hasSections).findings) {
-        if (finding.isLoss)
-            throw Failure(REFUSED, "line " + std::to_string(finding.line) + ": " + finding.text +
-                                       "; a save loses that (--force saves all the same)");
-    }
-}
-
 /// Changes the file itself, which is nobody else's yet. Returns what is in it then.
 std::vector<Entry> _rewrite(Family const& family, fs::path const& path,
                             std::function<void(Table&)> const& action) {
@@ -131,7 +121,8 @@ std::vector<Entry> _rewrite(Family const& family, fs::path const& path,
 void _copy(Family const& family, fs::path const& path, fs::path const& fresh, Options options) {
     if (options.isToReplace) return;
     fs::copy_file(path, fresh);
-    if (!options.mayLose) _refuseLoss(family, fresh);
+    bool const isText = family.text == &family;
+    if (isText && !options.mayLose) refuseLoss(readAll(fresh), family.hasSections);
 }
 
 /// Gives the new file the owner and the permissions of the old one; another owner where only root

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <iostream>
 
+#include "lint.h"
 #include "print.h"
 #include "text.h"
 
@@ -111,7 +112,11 @@ void remove(Family const& family, Arguments const& arguments) {
 
 void importFrom(Family const& family, Arguments const& arguments) {
     std::vector<Entry> const entries = about(arguments.input, [&] {
-        std::vector<Entry> parsed = parse(family, readAll(arguments.input), _format(arguments));
+        Format const format = _format(arguments);
+        std::string const bytes = readAll(arguments.input);
+        if (format == Format::TEXT && !arguments.options.mayLose)
+            refuseLoss(bytes, family.text->hasSections);
+        std::vector<Entry> parsed = parse(family, bytes, format);
         for (Entry const& entry : parsed) family.check(entry);
         return parsed;
     });

@@ -6,6 +6,7 @@
 #include <map>
 #include <sstream>
 
+#include "failure.h"
 #include "text.h"
 
 namespace tool {
@@ -96,7 +97,7 @@ private:
         if (header_ == 0 || hasEntries_) return;
         report_.findings.push_back(
             {header_, "section " + quoted(section_) + " has no entry here, so its header is lost",
-             true});
+             false});
     }
 
     void checkEntry(std::string const& line) {
@@ -141,6 +142,14 @@ private:
 
 Report lint(std::string const& bytes, bool hasSections) {
     return Linter(hasSections).report(bytes);
+}
+
+void refuseLoss(std::string const& bytes, bool hasSections) {
+    for (Finding const& finding : lint(bytes, hasSections).findings) {
+        if (finding.isLoss)
+            throw Failure(REFUSED, "line " + std::to_string(finding.line) + " would be lost: " +
+                                       finding.text + " (--force goes on all the same)");
+    }
 }
 
 } // namespace tool

@@ -11,16 +11,19 @@ namespace tool {
 struct Finding {
     std::size_t line; ///< from 1
     std::string text; ///< what is read there, and how
-    bool isLoss;      ///< whether the next save loses or garbles what the line is meant to say
+    bool isLoss;      ///< whether a save loses or garbles what the line is meant to say
 };
 
 struct Report {
     std::vector<Finding> findings;
-    std::size_t comments = 0; ///< which the next save drops, on purpose
+    std::size_t comments = 0; ///< which every save drops, as blank lines
     std::size_t blanks = 0;
 };
 
 Report lint(std::string const& bytes, bool hasSections);
+
+/// @throws Failure for the first loss
+void refuseLoss(std::string const& bytes, bool hasSections);
 
 } // namespace tool
 

@@ -86,10 +86,9 @@ private:
             ->check(CLI::IsMember({"text", "json"}));
     }
 
-    void addForce(Family const& family, CLI::App* sub) {
-        if (family.text == &family)
-            sub->add_flag("--force", arguments_.options.mayLose,
-                          "Save although that loses lines of which lint tells");
+    void addForce(CLI::App* sub) {
+        sub->add_flag("--force", arguments_.options.mayLose,
+                      "Go on although lines are lost of which lint tells");
     }
 
     void addFamily(Family const& family, char const* what) {
@@ -123,7 +122,7 @@ private:
         addKey(family, sub)->required();
         addText(sub, "VALUE", arguments_.value, "The value; without it, standard input");
         addRaw(family, sub);
-        addForce(family, sub);
+        if (family.text == &family) addForce(sub);
     }
 
     void addRemove(Family const& family, CLI::App* parent) {
@@ -131,7 +130,7 @@ private:
             add(parent, family, "remove",
                 family.hasSections ? "Remove a key, or a whole section" : "Remove a key", remove);
         addKey(family, sub)->required(!family.hasSections);
-        addForce(family, sub);
+        if (family.text == &family) addForce(sub);
     }
 
     void addImport(Family const& family, CLI::App* parent) {
@@ -141,7 +140,7 @@ private:
         sub->add_flag("--replace", arguments_.options.isToReplace,
                       "Remove what the file has before");
         addFormat(sub);
-        addForce(family, sub);
+        addForce(sub);
     }
 
     void addLint(Family const& family, CLI::App* parent) {

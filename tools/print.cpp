@@ -6,6 +6,7 @@
 #include <nlohmann/json.hpp>
 
 #include <sstream>
+#include <stdexcept>
 
 #include "access.h"
 #include "failure.h"
@@ -77,6 +78,7 @@ private:
 
 Entry _parseLine(Family const& family, std::string const& line) {
     Json const object = Json::parse(line);
+    if (object.size() != (family.hasSections ? 3U : 2U)) throw std::invalid_argument("size");
     Entry entry;
     if (family.hasSections) object.at("section").get_to(entry.section);
     object.at("key").get_to(entry.key);
@@ -92,7 +94,7 @@ std::vector<Entry> _parseJson(Family const& family, std::string const& bytes) {
         ++number;
         try {
             if (!line.empty()) result.push_back(_parseLine(family, line));
-        } catch (Json::exception const&) {
+        } catch (std::exception const&) {
             throw Failure(FAILED,
                           "line " + std::to_string(number) + " is no " + family.item + " in JSON");
         }
@@ -101,7 +103,6 @@ std::vector<Entry> _parseJson(Family const& family, std::string const& bytes) {
 }
 
 std::vector<Entry> _parseText(Family const& family, std::string const& bytes) {
-    if (!isUtf8(bytes)) throw Failure(FAILED, "it is no UTF-8");
     return read(*family.text, MemoryFile(bytes).path());
 }
 

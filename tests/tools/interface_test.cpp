@@ -1,6 +1,7 @@
 // How `koru` is called: help, version, wrong arguments, and the commands that need no file of ours.
 #include <doctest/doctest.h>
 
+#include <filesystem>
 #include <string>
 
 #include "tools/koru.h"
@@ -82,9 +83,11 @@ TEST_CASE("uuid shows an identifier as the library writes it, and refuses what i
 
 TEST_CASE("path shows which file a path names, for this program or another one") {
     Desk const desk;
-    std::string const program = KORU_TOOL;
-    std::string const folder = program.substr(0, program.rfind('/') + 1);
-    CHECK(desk.output({"path", "none.ini"}) == folder + "none.ini\n");
+    // By a link, for a path with a blank would end there.
+    std::filesystem::create_symlink(KORU_TOOL, desk / "koru");
+    std::string const folder = std::filesystem::canonical(KORU_TOOL).parent_path().string();
+    CHECK(test::execute(desk / "koru", {desk / "koru", "path", "none.ini"}).out ==
+          folder + "/none.ini\n");
     CHECK(desk.output({"path", "/a//b\\c/../d"}) == "/a/b/c/../d\n");
     desk.write("prog", "");
     CHECK(desk.output({"path", "none.ini", "--program", desk / "prog"}) ==

@@ -92,7 +92,7 @@ TEST_CASE("a file of which a save would lose a line is changed only by force") {
          {"k=v\n[s]\na=1\n", "[s]\na=1\nold text\n", "[s]\na=1\nb=\xFC\n"}) {
         CAPTURE(bytes);
         desk.write("f", bytes);
-        CHECK(desk.complaint({"settings", "set", "f", "s", "c", "2"}).find("; a save loses that") !=
+        CHECK(desk.complaint({"settings", "set", "f", "s", "c", "2"}).find(" would be lost: ") !=
               std::string::npos);
         CHECK(desk.koru({"settings", "remove", "f", "s"}).exitCode == 2);
         CHECK(desk.koru({"settings", "import", "f"}, "[s]\nd=4\n").exitCode == 2);

@@ -11,11 +11,13 @@
 #include <filesystem>
 #include <string>
 
+#include "support/skip.h"
 #include "support/tracedprocess.h"
 #include "tools/koru.h"
 
 namespace fs = std::filesystem;
 using test::Desk;
+using test::NOBODY;
 using test::Words;
 
 namespace {
@@ -96,6 +98,17 @@ TEST_CASE("a change keeps the permissions of the file") {
     }
 }
 
+TEST_CASE("a change by the administrator keeps owner and group, those of a link's file") {
+    Desk const desk;
+    desk.write("f", "[s]\nk=v\n");
+    if (::chown((desk / "f").c_str(), NOBODY, NOBODY) != 0)
+        return test::skipped("only the administrator gives files away");
+    fs::create_symlink("f", desk / "link");
+    CHECK(desk.output({"settings", "set", "link", "s", "k", "w"}) == "");
+    CHECK(statusOf(desk / "f").st_uid == NOBODY);
+    CHECK(statusOf(desk / "f").st_gid == NOBODY);
+}
+
 TEST_CASE("a file that has the value already is left alone") {
     Desk const desk;
     desk.write("f", MESSY);
@@ -145,6 +158,34 @@ TEST_CASE("a change that cannot be written leaves the old file and nothing else"
     CHECK(outcome.exitCode == 3);
     CHECK(desk.read("f") == "[s]\nk=v\n");
     CHECK(desk.names() == Words{"f"});
+}
+
+TEST_CASE("what its user may not change is told and left alone") {
+    struct Row {
+        mode_t file;
+        mode_t folder;
+        char const* complaint;
+    };
+    Row const rows[] = {
+        {0444, 0755, "koru: f: Permission denied\n"},
+        {0644, 0555, "koru: f: cannot make a folder beside it: Permission denied\n"},
+        {0644, 0300, "koru: f: cannot open its folder: Permission denied\n"},
+    };
+    for (Row const& row : rows) {
+        Desk const desk;
+        desk.write("f", "[s]\nk=v\n");
+        for (std::string const& path : {desk / "f", desk.path()})
+            REQUIRE((::geteuid() != 0 || ::chown(path.c_str(), NOBODY, NOBODY) == 0));
+        REQUIRE(::chmod((desk / "f").c_str(), row.file) == 0);
+        REQUIRE(::chmod(desk.path().c_str(), row.folder) == 0);
+        test::Run const run = desk.koru({"settings", "set", "f", "s", "k", "w"}, "", true);
+        REQUIRE(::chmod(desk.path().c_str(), 0755) == 0);
+        if (run.exitCode == 127) return test::skipped("an ordinary user cannot reach the program");
+        CHECK(run.exitCode == 3);
+        CHECK(run.err == row.complaint);
+        CHECK(desk.read("f") == "[s]\nk=v\n");
+        CHECK(desk.names() == Words{"f"});
+    }
 }
 
 TEST_CASE("killed at any system call, a change leaves the old file or the new one, whole") {
