@@ -34,8 +34,9 @@ public:
         std::istringstream in(bytes);
         for (std::string line; std::getline(in, line);) {
             ++number_;
+            line = trimmed(line);
             checkBytes(line);
-            checkLine(trimmed(line));
+            checkLine(line);
         }
         checkSectionHasEntries();
         std::stable_sort(report_.findings.begin(), report_.findings.end(), [](auto& a, auto& b) {
@@ -56,20 +57,25 @@ private:
         return line.substr(begin, line.find_last_not_of(BLANKS) - begin + 1);
     }
 
+    static bool isComment(std::string const& line) {
+        return !line.empty() && (line[0] == '#' || line[0] == ';');
+    }
+
     void checkBytes(std::string const& line) {
         if (number_ == 1 && line.rfind(BYTE_ORDER_MARK, 0) == 0)
             lose("a byte order mark is read as text of this line");
         if (line.find('\r') != std::string::npos)
             find("a carriage return is read as text of the line");
         if (line.find('\0') != std::string::npos)
-            lose("a NUL ends the name or value that it is in");
-        if (!isUtf8(line)) lose("a byte is no UTF-8, so the text is read as another one");
+            find("a NUL ends the name or value that it is in", !isComment(line));
+        if (!isUtf8(line))
+            find("a byte is no UTF-8, so the text is read as another one", !isComment(line));
     }
 
     void checkLine(std::string const& line) {
-        if (line.empty())
+        if (line.empty() || line == "\r")
             ++report_.blanks;
-        else if (line[0] == '#' || line[0] == ';')
+        else if (isComment(line))
             ++report_.comments;
         else if (hasSections_ && line[0] == '[')
             checkHeader(line);

@@ -88,6 +88,12 @@ TEST_CASE("lint goes through several files and stops at one that is missing") {
 
 TEST_CASE("a file of which a save would lose a line is changed only by force") {
     Desk const desk;
+    for (std::string const bytes : {"# \xFC\n[s]\na=1\n", "[s]\na=1\n\r\n[t]\n"}) {
+        CAPTURE(bytes);
+        desk.write("f", bytes);
+        CHECK(desk.output({"settings", "set", "f", "s", "a", "2"}) == "");
+        CHECK(desk.read("f") == "[s]\na=2\n");
+    }
     for (std::string const bytes :
          {"k=v\n[s]\na=1\n", "[s]\na=1\nold text\n", "[s]\na=1\nb=\xFC\n"}) {
         CAPTURE(bytes);
