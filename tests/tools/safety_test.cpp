@@ -11,6 +11,7 @@
 #include <filesystem>
 #include <string>
 
+#include "support/sanitizers.h"
 #include "support/skip.h"
 #include "support/tracedprocess.h"
 #include "tools/koru.h"
@@ -192,7 +193,7 @@ TEST_CASE("killed at any system call, a change leaves the old file or the new on
     Desk const desk;
     long call = 0;
     long oldOnes = 0;
-    long const step = 3; // each takes its time, and most of them load the program
+    long const step = test::SANITIZED ? 9 : 1; // a sanitizer takes its time to begin
     for (bool isKilled = true; isKilled; call += step) {
         desk.write("f", "[s]\nk=old\n");
         isKilled = test::killedAtCall(call, [&] {
