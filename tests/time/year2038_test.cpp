@@ -132,15 +132,16 @@ TEST_CASE("a timer made after 2038 starts at 0 on 32 bits and never moves") {
 TEST_CASE("a timer made before 2038 shows a negative time after it on 32 bits") {
     Clock clock(LAST_OF_32_BITS - 127);
     Timer const timer;
-    clock.now += 1024;
-    CHECK(text(timer) == (IS_32_BIT ? "-2147483520.000" : "1024.000"));
+    clock.now += 1152;
+    CHECK(text(timer) == (IS_32_BIT ? "-2147483520.000" : "1152.000"));
 }
 
 TEST_CASE("a wait with a limit fails after 2038 on 32 bits, and the flag is as it was") {
+    if (!IS_32_BIT) return; // It would wait until then.
     Clock const clock(LAST_OF_32_BITS + 1);
     Koru::Event event(true);
     event.signal();
-    CHECK(event.wait(0) == (IS_32_BIT ? -1 : 1));
+    CHECK(event.wait(0) == -1);
     CHECK(event.test());
 }
 
