@@ -2,9 +2,8 @@
 // disk and hold zeros where nothing was written.
 #include <doctest/doctest.h>
 
-#include <sys/resource.h>
-
 #include <climits>
+#include <cstddef>
 #include <cstdint>
 #include <filesystem>
 #include <fstream>
@@ -14,7 +13,6 @@
 #include <stdexcept>
 #include <string>
 #include <system_error>
-#include <vector>
 
 #include <koru/datafile.h>
 #include <koru/file.h>
@@ -24,9 +22,8 @@
 #include <koru/string.h>
 #include <koru/system.h>
 
-#include "support/sanitizers.h"
+#include "support/failingmemory.h"
 #include "support/skip.h"
-#include "support/subprocess.h"
 #include "support/tempdir.h"
 
 using Koru::File;
@@ -65,34 +62,11 @@ std::uintmax_t at(std::streampos position) {
     return static_cast<std::uintmax_t>(static_cast<std::streamoff>(position));
 }
 
-/// What `use` throws while memory is short: 64 MiB more than the process has now.
+/// What `use` throws where memory is short: no allocation of 16 MiB or more succeeds.
 template <class Use>
 std::string whileMemoryIsShort(Use use) {
-    return test::toldByChild([&] {
-        std::ifstream status("/proc/self/statm");
-        rlim_t pages = 0;
-        status >> pages;
-        rlim_t const most = pages * 4096 + 64 * 1024 * 1024;
-        rlimit const limit = {most, most};
-        ::setrlimit(RLIMIT_AS, &limit);
-        try {
-            use();
-        } catch (std::bad_alloc const&) {
-            return std::string("std::bad_alloc");
-        } catch (std::exception const& e) {
-            return std::string(e.what());
-        }
-        return std::string("nothing");
-    });
-}
-
-bool memoryCanBeShort() {
-#if defined(KORU_ADDRESS_SANITIZER) || defined(KORU_THREAD_SANITIZER)
-    test::skipped("a sanitizer needs more memory than the limit leaves");
-    return false;
-#else
-    return true;
-#endif
+    std::size_t const least = 16U << 20U;
+    return test::runOutOfMemory({0, test::Failing::ONE_AND_ALL_LATER, least, SIZE_MAX}, use);
 }
 
 } // namespace
@@ -212,7 +186,6 @@ TEST_CASE("a log is appended to past 2 and past 4 GiB") {
 
 TEST_CASE(
     "a settings file that memory cannot hold is std::bad_alloc, and nothing of it is written") {
-    if (!memoryCanBeShort()) return;
     LargeFile const large(5 * GIB, "[s]\nk=1\n");
     if (!large.isThere) return;
     CHECK(whileMemoryIsShort([&] {
@@ -233,7 +206,6 @@ TEST_CASE(
 
 TEST_CASE(
     "records beyond what memory can hold are std::bad_alloc, and those before them are held") {
-    if (!memoryCanBeShort()) return;
     // The key "a" with no data; then the key "b" with 1 GiB of data, which is there.
     std::string const start("\2\0\0\0\0a\0\0\0\0"
                             "\2\0\0\0\0b\0\0\0\x40",
