@@ -8,6 +8,7 @@
 #include <locale.h>
 #include <stdlib.h>
 
+#include <memory>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -106,25 +107,29 @@ private:
 };
 
 inline std::vector<NamedLocale> const& allLocales() {
-    static Locales locales; // compiling one takes a second
-    if (!locales.all().empty()) return locales.all();
-    locales.addInstalled();
-    // Turkish pairs i and I otherwise, and in the Latin ones bytes above 0x7F have case.
-    locales.compile("tr_TR.UTF-8", "tr_TR", "UTF-8");
-    locales.compile("tr_TR.ISO-8859-9", "tr_TR", "ISO-8859-9");
-    locales.compile("de_DE.ISO-8859-1", "de_DE", "ISO-8859-1");
-    return locales.all();
+    static auto const locales = [] {
+        auto all = std::make_unique<Locales>(); // compiling one takes a second
+        all->addInstalled();
+        // Turkish pairs i and I otherwise, and in the Latin ones bytes above 0x7F have case.
+        all->compile("tr_TR.UTF-8", "tr_TR", "UTF-8");
+        all->compile("tr_TR.ISO-8859-9", "tr_TR", "ISO-8859-9");
+        all->compile("de_DE.ISO-8859-1", "de_DE", "ISO-8859-1");
+        return all;
+    }();
+    return locales->all();
 }
 
 /// Those that docs/locale.md is about.
 inline std::vector<NamedLocale> const& documentedLocales() {
-    static Locales locales;
-    if (!locales.all().empty()) return locales.all();
-    locales.add("C");
-    locales.add("C.UTF-8");
-    locales.compile("de_DE.UTF-8", "de_DE", "UTF-8");
-    locales.compile("tr_TR.UTF-8", "tr_TR", "UTF-8");
-    return locales.all();
+    static auto const locales = [] {
+        auto all = std::make_unique<Locales>();
+        all->add("C");
+        all->add("C.UTF-8");
+        all->compile("de_DE.UTF-8", "de_DE", "UTF-8");
+        all->compile("tr_TR.UTF-8", "tr_TR", "UTF-8");
+        return all;
+    }();
+    return locales->all();
 }
 
 /// Calls `use` under each of the locales in turn.
