@@ -11,6 +11,11 @@ amd64) personality=linux64 ;;
 *) fail "no architecture $architecture; there are: i386 amd64" ;;
 esac
 
+# What is mounted in there, is mounted for that command only. In a chroot whose root is not mounted
+# itself, unshare cannot part the mounts, and they go because they are unmounted.
+own=(unshare --mount)
+"${own[@]}" true 2>/dev/null || own+=(--propagation unchanged)
+
 # enter ROOT COMMAND...: runs the command inside, with /proc, which goes with the command, and nothing
 # else of the system outside. The network is that of the system outside.
 enter() {
@@ -19,7 +24,9 @@ enter() {
     cp /etc/resolv.conf "$root/etc/resolv.conf"
     # The variables are those of the inner shell.
     # shellcheck disable=SC2016
-    unshare --mount bash -c 'mount -t proc proc "$0/proc" && exec chroot "$0" "$@"' "$root" \
+    "${own[@]}" bash -ec 'mount -t proc proc "$0/proc"
+        trap "umount --lazy \"$0/proc\"" EXIT
+        chroot "$0" "$@"' "$root" \
         setarch "$personality" env --ignore-environment HOME=/root LC_ALL=C.UTF-8 TERM=dumb \
         PATH=/usr/local/sbin:/usr/local/bin:/usr/sbin:/usr/bin:/sbin:/bin \
         DEBIAN_FRONTEND=noninteractive DEB_BUILD_OPTIONS="parallel=${jobs:?} ${DEB_BUILD_OPTIONS:-}" \
@@ -49,7 +56,7 @@ makeBase() {
     rm -f "$base.made"
     discard "$base"
     mkdir -p "$base"
-    step "root: $release, $architecture" unshare --mount debootstrap --variant=minbase \
+    step "root: $release, $architecture" "${own[@]}" debootstrap --variant=minbase \
         --arch="$architecture" "$release" "$base" "$uri"
     # What is in these roots need not survive a power cut.
     echo force-unsafe-io >"$base/etc/dpkg/dpkg.cfg.d/unsafe-io"
