@@ -34,9 +34,9 @@ class RecordSet;
 /// to 0xFFFFFFFF. Only characters from 0x00 to 0x7F survive.
 ///
 /// Every operation except construction and destruction holds the file's lock from beginning to end,
-/// so several threads may use one object at once, except for the references that `operator[]`
-/// gives. Every operation may throw `std::bad_alloc`. A thread that is cancelled in `open` leaves
-/// the mode 0, so that nothing is written.
+/// so several threads may use one object at once, but not the references that `operator[]` returns.
+/// Every operation may throw `std::bad_alloc`. A thread that is cancelled in `open` leaves the mode
+/// 0, so that nothing is written.
 class KORU_EXPORT DataFile : public File {
 public:
     class Record;
@@ -52,17 +52,17 @@ public:
     DataFile& operator=(DataFile const&) = delete;
 
     /// Does what `close` does if the file is open. Failures are lost; to see them, call
-    /// `close` before.
+    /// `close` first.
     ~DataFile() override;
 
     /// Opens the file as `File::open` does, with `BINARY` added to the mode, and replaces the
-    /// records: with `READ`, by those of the file, all of those with equal keys; otherwise by none.
+    /// records: with `READ`, by all of the file's, duplicate keys included; otherwise by none.
     /// @throws std::runtime_error "failed to open file."; the records are unchanged
     /// @throws std::runtime_error "failed to read from file" for an entry that is cut short or
     ///         claims to be longer than the file, and where reading fails; std::invalid_argument
     ///         "zero length key" for an entry without a key; on 32 bits std::bad_alloc for a length
-    ///         of 2 GiB or more. The file is open then and the entries before that one are held;
-    ///         with `WRITE` the destructor writes those unless you call `setMode(0)` before.
+    ///         of 2 GiB or more. The file is then open and holds the entries before that one; with
+    ///         `WRITE` the destructor writes those unless you call `setMode(0)` first.
     void open(unsigned long mode) override;
     /// Refuses a stream's open mode, as `File` does.
     void open(std::ios_base::openmode) = delete;
@@ -71,11 +71,11 @@ public:
     /// destroys the records and closes the file; without `WRITE`, changes are lost silently. An
     /// error that only close(2) reports, such as a quota, shows in `fail()` and throws nothing.
     /// Holds cancellation off.
-    /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
+    /// @throws std::runtime_error "failed to write to file"; the file is then open and partly
     ///         written, the records intact
-    /// @throws std::runtime_error "failed to open file."; the mode is 0 then, the records intact:
-    ///         `setMode` and another `close` try again. The file is gone or empty; or as it was, if
-    ///         neither was possible; or the new one, if it could be written without a stream.
+    /// @throws std::runtime_error "failed to open file."; the mode is then 0, the records intact:
+    ///         `setMode` and another `close` try again. The file is gone or empty; as it was, if
+    ///         neither was possible; the new one, if it could be written without a stream.
     /// @throws std::runtime_error "failed to close file."
     void close() override;
 
@@ -117,16 +117,16 @@ public:
     /// Virtual, so that derived records can be deleted through a pointer to this class.
     virtual ~Record();
 
-    /// The key; the reference is valid as long as the record and until `setKey`.
+    /// The key; the reference is valid until `setKey` is called or the record destroyed.
     virtual std::wstring const& getKey() const;
 
-    /// Sets the key, without the blanks, tabs and line feeds at its ends; a key of nothing else
-    /// stays as it is.
+    /// Sets the key, without the blanks, tabs and line feeds at its ends; a key that consists of
+    /// nothing else stays as it is.
     /// @throws std::invalid_argument "zero length key" when what remains is empty or begins with
     ///         NUL; the record is unchanged
     virtual void setKey(std::wstring const& key);
 
-    /// The data; the reference is valid as long as the record and until `setData`.
+    /// The data; the reference is valid until `setData` is called or the record destroyed.
     virtual std::vector<unsigned char> const& getData() const;
 
     /// Sets the data.

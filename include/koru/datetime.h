@@ -44,11 +44,11 @@ public:
     /// @throws std::invalid_argument "t is too small."  when the C library cannot convert it
     DateTime(long seconds, unsigned int parts = DATE | TIME);
 
-    /// The same with milliseconds, which are set whatever the parts.
+    /// The same with milliseconds, which it sets whatever the parts.
     DateTime(timeval const& time, unsigned int parts = DATE | TIME);
 
     /// Reads the given parts of "YYYY-MM-DD HH:MM:SS", "YYYY-MM-DD" or, for `TIME` alone,
-    /// "HH:MM:SS". Intended: it ignores the character between date and time and all that follows
+    /// "HH:MM:SS". Intended: it ignores the character between date and time and everything after
     /// the last part, reads numbers as `strtol` does, and leaves a field of the date 0 where the
     /// number is 0 or missing.
     /// @throws std::invalid_argument "incorrect format.", and what the setters throw
@@ -60,11 +60,11 @@ public:
     std::uint8_t getHour() const;         ///< 0 to 23
     std::uint8_t getMinute() const;       ///< 0 to 59
     std::uint8_t getSecond() const;       ///< 0 to 59
-    std::uint32_t getMillisecond() const; ///< within the second, but any number that was set
+    std::uint32_t getMillisecond() const; ///< within the second, or whatever number was set
     std::int16_t getOffset() const;       ///< hours or minutes, see above
 
     /// @name Setters
-    /// Each checks and sets one field; when it refuses a value, the object is as it was. Nothing
+    /// Each checks and sets one field; when it refuses a value, the object is unchanged. Nothing
     /// checks the day against the month.
     /// @{
 
@@ -91,8 +91,8 @@ public:
     /// Sets the fields of the given parts to 0. The value keeps the parts that it had.
     void clear(unsigned int parts);
 
-    /// The seconds since the epoch for the fields as local time, with daylight saving as the C
-    /// library finds it; -1 if `mktime` fails. A year of 0 counts as 1900, a month of 0 as January.
+    /// The seconds since the epoch for the fields as local time; -1 if `mktime` fails. The C
+    /// library decides on daylight saving. A year of 0 counts as 1900, a month of 0 as January.
     operator long() const;
 
     /// "YYYY-MM-DD HH:MM:SS", or the half of it that the value has; empty when it has none.

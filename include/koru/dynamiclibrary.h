@@ -12,16 +12,16 @@ namespace Koru {
 /// A shared library that is loaded on request (`dlopen`, POSIX) and unloaded at the latest when the
 /// object is destroyed. Each object owns at most one handle. It has no lock: threads that share an
 /// object guard it themselves. The operations throw nothing but `std::bad_alloc`. The object does
-/// not keep the reason of a failure; `dlerror` tells it right after a failed `load`.
+/// not keep the reason for a failure; `dlerror` tells it right after a failed `load`.
 class KORU_EXPORT DynamicLibrary {
 public:
     /// Not loaded, with an empty name.
     DynamicLibrary();
 
     /// Not loaded. The loader gets the name as UTF-8, otherwise unchanged: it searches for a name
-    /// without a slash, and a relative path counts from the working directory. It searches on
-    /// behalf of libkoru: it does not use the program's DT_RUNPATH (but DT_RPATH and
-    /// LD_LIBRARY_PATH), and $ORIGIN is the folder of libkoru.
+    /// without a slash, and a relative path starts at the working directory. It searches on behalf
+    /// of libkoru: it uses LD_LIBRARY_PATH and the program's DT_RPATH, but not its DT_RUNPATH, and
+    /// $ORIGIN is the folder of libkoru.
     DynamicLibrary(std::wstring const& fileName);
 
     /// Copies the name and, if the other object is loaded, loads the library again under a handle
@@ -35,8 +35,8 @@ public:
     /// Unloads the library.
     virtual ~DynamicLibrary();
 
-    /// Loads the library, unless it is loaded. Its functions are bound when they are first called,
-    /// and other libraries do not see its symbols.
+    /// Loads the library, unless it is already loaded. Its functions are bound when they are first
+    /// called, and other libraries do not see its symbols.
     /// @return whether it is loaded now
     virtual bool load();
 
@@ -47,7 +47,7 @@ public:
     /// Whether the object has a handle.
     virtual bool isLoaded() const;
 
-    /// The loader's handle, null when not loaded. The object keeps owning it.
+    /// The loader's handle, null when not loaded. The object still owns it.
     void* getHandle() const;
 
     /// The name as it was given.

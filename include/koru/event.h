@@ -28,13 +28,13 @@ public:
     Event(Event const&) = delete;
     Event& operator=(Event const&) = delete;
 
-    /// Destroys the event, for which no thread may be waiting.
+    /// Destroys the event; no thread may be waiting for it.
     virtual ~Event();
 
     /// Raises the flag and wakes one waiting thread.
     void signal();
 
-    /// Waits for one notification. A cancellation point, after which the event stays usable.
+    /// Waits for one notification. A cancellation point; a cancelled wait leaves the event usable.
     /// @param timeout  whole seconds (`Mutex::lock` counts milliseconds); 0xFFFFFFFF, the default,
     ///                 waits without limit, as does an argument with all bits set. A deadline that
     ///                 `time_t` cannot hold is replaced by the last one that it can.

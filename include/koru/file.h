@@ -29,7 +29,7 @@ extern KORU_EXPORT wchar_t const _COLON;  ///< a colon, which nothing uses: ther
 /// The lock serialises `open`, `close`, `synchronize` and the operations of derived classes.
 /// `getMode`, `setMode` and `getName` do not take it; any thread may call them at any time. The
 /// stream operations inherited from `std::fstream` do not take it either: threads that write to one
-/// object directly call `lock` and `unlock` around that.
+/// object call `lock` and `unlock` themselves.
 ///
 /// Stream errors show in the stream's state, as with any stream. `open` clears the state only where
 /// it creates a missing file with `READ | WRITE`, so call `clear()` before you reuse an object
@@ -47,7 +47,7 @@ public:
     File();
 
     /// A closed file. It keeps the name verbatim and gives it to the system as UTF-8
-    /// (`make_string`); a relative name counts from the working directory.
+    /// (`make_string`); a relative name starts at the working directory.
     File(std::wstring const& name);
 
     /// Not copyable, as no stream is.
@@ -55,17 +55,17 @@ public:
     File& operator=(File const&) = delete;
 
     /// Closes the file as soon as the lock is free; holds cancellation off. Failures are lost; to
-    /// see them, call `close` before.
+    /// see them, call `close` first.
     virtual ~File();
 
     /// Opens the file. `READ` opens an existing file; `WRITE` creates the file or empties an
     /// existing one; `READ | WRITE` opens an existing file with its content, or creates it.
     /// On a file that is already open, it only remembers the mode and sets the fail state: the file
     /// stays open as it was.
-    /// @throws std::runtime_error "failed to open file."; the object is closed then, its mode
-    ///         unchanged, `errno` has the reason, and the file on the disk is as it was. Also for a
-    ///         mode with neither `READ` nor `WRITE`.
-    // LogFile hides this operation on purpose; GCC warns of that here, Clang there.
+    /// @throws std::runtime_error "failed to open file."; the object is then closed, its mode
+    ///         unchanged, `errno` has the reason, and the file on the disk is as it was. Also
+    ///         thrown for a mode with neither `READ` nor `WRITE`.
+    // LogFile hides this operation on purpose; GCC warns about that here, Clang there.
 #pragma GCC diagnostic push
 #pragma GCC diagnostic ignored "-Woverloaded-virtual"
     virtual void open(unsigned long mode);
@@ -77,7 +77,7 @@ public:
     /// Writes out what is buffered, closes the file and resets the mode to 0. Sets the fail state
     /// if writing out fails or the file is not open. When the thread is cancelled while it writes
     /// out, the file is closed, and what was still buffered is lost.
-    /// @throws std::runtime_error "failed to close file."; the file is open then, its
+    /// @throws std::runtime_error "failed to close file."; the file is then open, its
     ///         mode unchanged
     virtual void close();
 
@@ -107,13 +107,13 @@ public:
     /// Whether anything exists at the path, a directory included.
     static bool exists(std::wstring const& path);
 
-    /// Renames a file and replaces one at the target.
-    /// @return whether nothing is at `from` and something is at `to` afterwards; so it is true also
+    /// Renames a file, replacing any file at the target.
+    /// @return whether nothing is at `from` and something is at `to` afterwards; so it is also true
     ///         when `from` was missing all along and `to` was there before
     static bool rename(std::wstring const& from, std::wstring const& to);
 
     /// Gives a file or an empty directory the mode 0600, then removes it.
-    /// @return whether nothing is at the path afterwards; so it is true also when nothing was
+    /// @return whether nothing is at the path afterwards; so it is also true when nothing was there
     static bool remove(std::wstring const& path);
 
     /// Intended: copies no content. It creates or empties `to` and writes the text form of a
@@ -136,9 +136,9 @@ private:
 ///
 /// A path that does not begin with `/` is relative to the directory of the running executable
 /// (`System::getProcessFileName`), not to the working directory. It is resolved with `realpath`
-/// (POSIX) as far as it exists, links to what does not exist yet included, and the rest is
-/// appended. An absolute path is not resolved: `.`, `..` and links stay in it. In both, backslashes
-/// become slashes, and repeated slashes become one. In a program /opt/app/bin/prog:
+/// (POSIX) as far as it exists, dangling links included, and the rest is appended. An absolute path
+/// is not resolved: `.`, `..` and links stay in it. In both, backslashes become slashes, and
+/// repeated slashes become one. In a program /opt/app/bin/prog:
 ///
 /// | text                    | directory             | name      |
 /// |-------------------------|-----------------------|-----------|

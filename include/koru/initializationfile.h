@@ -60,8 +60,8 @@ public:
     InitializationFile& operator=(InitializationFile const&) = delete;
 
     /// Does what `close` does, even when an exception between two changes destroys the object; to
-    /// give up the changes, call `setMode(0)` before. Failures are lost; to see them, call
-    /// `close` before.
+    /// give up the changes, call `setMode(0)` first. Failures are lost; to see them, call
+    /// `close` first.
     ~InitializationFile() override;
 
     /// Opens the file as `File::open` does and replaces the table: with `READ`, by the sorted
@@ -69,7 +69,7 @@ public:
     /// @throws std::runtime_error "failed to open file."; the table is unchanged
     /// @throws std::runtime_error "failed to read from file"; the file stays open, the table holds
     ///         what was read, and with `WRITE` the destructor writes that unless you call
-    ///         `setMode(0)` before
+    ///         `setMode(0)` first
     void open(unsigned long mode) override;
     /// Refuses a stream's open mode, as `File` does.
     void open(std::ios_base::openmode) = delete;
@@ -78,11 +78,11 @@ public:
     /// one. In any case empties the table and closes the file; without `WRITE`, changes are lost
     /// silently. An error that only close(2) reports, such as a quota, shows in `fail()` and throws
     /// nothing. Holds cancellation off.
-    /// @throws std::runtime_error "failed to write to file"; the file is open then and partly
+    /// @throws std::runtime_error "failed to write to file"; the file is then open and partly
     ///         written, the table intact
-    /// @throws std::runtime_error "failed to open file."; the mode is 0 then and the table intact:
-    ///         `setMode` and another `close` try again. The file is gone or empty; or as it was, if
-    ///         neither was possible; or the new one, if it could be written without a stream.
+    /// @throws std::runtime_error "failed to open file."; the mode is then 0 and the table intact:
+    ///         `setMode` and another `close` try again. The file is gone or empty; as it was, if
+    ///         neither was possible; the new one, if it could be written without a stream.
     /// @throws std::runtime_error "failed to close file."
     void close() override;
 

@@ -40,14 +40,14 @@ public:
     LogFile(LogFile const&) = delete;
     LogFile& operator=(LogFile const&) = delete;
 
-    /// Closes the file. Failures are lost; to see them, flush before and look at the state.
+    /// Closes the file. Failures are lost; to see them, flush first and look at the state.
     ~LogFile() override;
 
     /// Opens the log for appending. This is an operation of its own, which hides `File::open`.
     /// `READ | WRITE` keeps the content, `WRITE` alone empties the file first; both create a
     /// missing file. A log that is open stays open, in the fail state: it drops all output
     /// until `clear()`.
-    /// @throws std::runtime_error "failed to open file."; the log is closed then. Where the file
+    /// @throws std::runtime_error "failed to open file."; the log is then closed. Where the file
     ///         itself can be opened, as with a mode that lacks `WRITE`, a line goes to standard
     ///         output first: "File::open() failed to open " and the name.
 #pragma GCC diagnostic push

@@ -18,7 +18,7 @@
 namespace Koru {
 
 /// @{
-/// The empty strings of which `make_string` and `make_wstring` return copies. They exist before any
+/// The empty strings; `make_string` and `make_wstring` return copies of them. They exist before any
 /// function of the library can be called, even by the static constructors of an application.
 extern KORU_EXPORT std::string const _null_string;
 extern KORU_EXPORT std::wstring const _null_wstring;
@@ -78,10 +78,9 @@ KORU_EXPORT std::ostream& operator<<(std::ostream& os, std::wstring const& s);
 
 /// Writes the first n bytes of the string, n being the low 8 bits of its stored size read as a
 /// signed number; nothing when n is 0 or negative.
-/// Intended: of 127 bytes it writes all, of 128 to 256 bytes none, of 300 bytes the first 44. For
-/// text of any length, use `os.write`. Inside namespace `Koru`, and wherever that is imported,
-/// the compiler chooses this operator over the standard one. Width and fill apply to the first
-/// byte only.
+/// Intended: it writes all of 127 bytes, none of 128 to 256, and the first 44 of 300. For text of
+/// any length, use `os.write`. Inside namespace `Koru`, and wherever that is imported, the compiler
+/// chooses this operator over the standard one. Width and fill apply to the first byte only.
 KORU_EXPORT std::ostream& operator<<(std::ostream& os, std::string const& s);
 
 } // namespace Koru

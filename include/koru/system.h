@@ -16,12 +16,12 @@ public:
     /// "/proc/self/cmdline" gives it; `File::Path` resolves relative paths against its directory.
     /// An empty string when that cannot be read. Several threads may call it at once.
     ///
-    /// Intended: argv[0] counts up to its first blank and its first 4095 bytes, and a relative one
-    /// is resolved against the current working directory, not that of the program's start. So the
-    /// path is not the program's own if it was started by a relative path and has called `chdir`
-    /// since, if it was found through PATH, or if it lies under a folder with a blank in its name.
-    /// Where nothing exists at the resolved path, the result is what `realpath` (POSIX) leaves in
-    /// its buffer: with glibc, the path up to and including the first missing component.
+    /// Intended: argv[0] is cut at its first blank and after 4095 bytes, and a relative one is
+    /// resolved against the current working directory, not that of the program's start. So the path
+    /// is not the program's own if it was started by a relative path and has called `chdir` since,
+    /// if it was found through PATH, or if it lies under a folder with a blank in its name. Where
+    /// nothing exists at the resolved path, the result is what `realpath` (POSIX) leaves in its
+    /// buffer: with glibc, the path up to and including the first missing component.
     static std::wstring getProcessFileName();
 
     /// The platform's type: always 0 here.
@@ -31,7 +31,7 @@ public:
     static std::wstring getVersion();
 
     /// @name The host
-    /// Each is empty where the system does not tell. The last two look the name up with
+    /// Each is empty where the system does not provide it. The last two look the name up with
     /// `gethostbyname` (POSIX.1-2001), which uses static storage: threads that call them at once
     /// need a lock of their own.
     /// @{
@@ -42,7 +42,7 @@ public:
     /// The host's official name, as the resolver gives it.
     static std::wstring getIpHostName();
 
-    /// The host's first IPv4 address, as in 127.0.0.1.
+    /// The host's first IPv4 address, in the form 127.0.0.1.
     static std::wstring getIpAddress();
 
     /// @}

@@ -13,7 +13,7 @@ namespace Koru {
 /// controlling thread calls `start`, `join`, `detach` and `abort`; the object has no lock.
 ///
 /// The object has to outlive its thread, as its destructor neither joins nor ends the thread. So a
-/// derived class joins in its own destructor, or the caller joins before.
+/// derived class joins in its own destructor, or the caller joins first.
 class KORU_EXPORT Thread {
 public:
     /// An object that has not started its thread.
@@ -40,8 +40,8 @@ public:
     /// @return the thread's exit value, which `join` returns
     virtual void* run(void* argument);
 
-    /// Cancels the thread, whose stack is unwound from its next cancellation point, and detaches
-    /// it, so nobody learns when it has ended. Does nothing unless it is started and not detached.
+    /// Cancels the thread, which unwinds its stack at its next cancellation point, and detaches it,
+    /// so nobody learns when it has ended. Does nothing unless it is started and not detached.
     void abort();
 
     /// Detaches the thread; called before `start`, makes it start detached.

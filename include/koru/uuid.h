@@ -24,14 +24,14 @@ public:
     /// The 16 bytes in the order given.
     Uuid(unsigned char const (&bytes)[16]);
 
-    /// The same; all zero when the vector has any other size than 16.
+    /// The same; all zero when the vector's size is not 16.
     Uuid(std::vector<unsigned char> const& bytes);
 
     /// Reads the text form, in lower or upper case; all zero for text that it refuses.
     /// Intended: it accepts every text of 36 hexadecimal digits and hyphens (counted up to the
     /// first NUL) that has no hyphen among its last n characters, n being the number of its
     /// hyphens. So hyphens may be in other places, and of 36 digits without a hyphen it ignores the
-    /// last four. With more than four hyphens fewer than 32 digits are enough; it reads the last
+    /// last four. With more than four hyphens, fewer than 32 digits are enough; it reads the last
     /// ones twice.
     Uuid(std::string const& text);
 

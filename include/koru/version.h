@@ -4,8 +4,8 @@
 #define KORU_VERSION_H
 
 /// @{
-/// The three parts of the version. Releases with the same first part keep every binary that was
-/// linked to one of them running; the second part grows when something is added.
+/// The three parts of the version. A binary that was linked to one release keeps running with every
+/// later one that has the same first part; the second part grows when something is added.
 #define KORU_VERSION_MAJOR 1
 #define KORU_VERSION_MINOR 0
 #define KORU_VERSION_PATCH 0
