@@ -4,7 +4,7 @@
 // the unwinding and does not rethrow it ends the process, and so does an unwinding that begins in a
 // destructor. So code that catches everything lets the unwinding pass first, and destructors hold
 // cancellation off. The unwinding carries no object: a handler that names it binds a null
-// reference, of which the sanitizer would complain.
+// reference, about which the sanitizer would complain.
 #ifndef KORU_CONCURRENCY_CANCELLATION_H
 #define KORU_CONCURRENCY_CANCELLATION_H
 

@@ -11,7 +11,7 @@ namespace Koru {
 
 namespace {
 
-// On 64 bits, an event takes this for no limit, too.
+// On 64 bits, this means no limit to an event, too.
 constexpr unsigned long LONGEST = std::numeric_limits<unsigned long>::max();
 
 /// Holds a POSIX mutex for a scope. The unwinding of a cancelled wait releases it too.

@@ -37,7 +37,7 @@ Mutex::~Mutex() { ::pthread_mutex_destroy(&mutex_); }
 
 namespace {
 
-/// Goes on after the first try has failed. Intended: sleeps after the last try too.
+/// Keeps trying after the first try has failed. Intended: sleeps after the last try too.
 void _poll(pthread_mutex_t& mutex, unsigned long timeout) {
     for (unsigned long tries = 0; tries < timeout;) {
         ::usleep(POLL_INTERVAL);

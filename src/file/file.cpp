@@ -50,7 +50,7 @@ void File::open(unsigned long mode) {
     std::ios::openmode const openMode = _openMode(mode);
     errno = 0;
     bool const opened = openBuffer(*rdbuf(), name, openMode);
-    // Only a missing file may be truncated: after any other failure, such as want of memory or of
+    // Only a missing file may be truncated: after any other failure, such as a lack of memory or
     // descriptors, a signal or a disk error, it may well exist.
     bool const missing = !is_open() && errno == ENOENT;
     if (!opened) setstate(std::ios::failbit);
@@ -115,7 +115,7 @@ bool File::rename(std::wstring const& from, std::wstring const& to) {
 bool File::remove(std::wstring const& path) {
     std::string const name = make_string(path);
     static_cast<void>(::chmod(name.c_str(), S_IRUSR | S_IWUSR));
-    // Only after a failure has to be asked whether the file exists.
+    // Only a failure leaves open whether the file still exists.
     return std::remove(name.c_str()) == 0 || !exists(path);
 }
 

@@ -11,7 +11,7 @@
 
 namespace Koru {
 
-/// The bytes of a file, up to its end or to what prevented reading on.
+/// The bytes of a file, up to its end or to what stopped the reading.
 struct FileBytes {
     std::string_view view() const { return std::string_view(data.get(), size); }
 
@@ -20,12 +20,12 @@ struct FileBytes {
     std::exception_ptr failure; ///< what prevented reading on; null at the end of the file
 };
 
-/// Gives the bytes of a file in the portions in which they arrive from the system. So the size that
-/// the file claims to have is never relied on, and bytes that arrive before an error are not lost.
+/// Gives the bytes of a file in the portions in which they arrive from the system. So it never
+/// relies on the size that the file claims to have, and loses no bytes that arrive before an error.
 class FileReader {
 public:
-    /// Flushes the stream, clears its state and goes to the start of the file. What has no start, a
-    /// pipe, is read from where it is.
+    /// Flushes the stream, clears its state and goes to the start of the file. A pipe, which has no
+    /// start, is read from where it is.
     /// @throws std::runtime_error "failed to read from file" if buffered output cannot be written,
     ///         or if the seek fails: the file would look empty
     explicit FileReader(File& file);
@@ -33,8 +33,8 @@ public:
     FileReader(FileReader const&) = delete;
     FileReader& operator=(FileReader const&) = delete;
 
-    /// How many bytes have arrived and are not taken yet. Reads the next portion if there are none;
-    /// 0 means the end of the file or an error.
+    /// How many bytes have arrived and have not been taken yet. Reads the next portion if there are
+    /// none; 0 means the end of the file or an error.
     std::size_t arrived();
 
     /// Takes up to `size` of the bytes that have arrived, and returns how many it took.
@@ -47,8 +47,9 @@ public:
     /// @throws std::runtime_error "failed to read from file"
     [[noreturn]] void fail();
 
-    /// Reads the rest of the file. An error, an exception of the stream or want of memory ends that
-    /// early and becomes the `failure` of the bytes. Leaves the stream as a peek at the end does.
+    /// Reads the rest of the file. An error, an exception of the stream or a lack of memory ends
+    /// the reading early and becomes the `failure` of the bytes. Leaves the stream as a peek at the
+    /// end does.
     FileBytes readAll();
 
 private:

@@ -57,7 +57,7 @@ std::string _below(std::string const& directory, std::string const& path) {
 }
 
 /// Resolves the part of the path that exists and appends the rest as it is. If the first missing
-/// component is a link, its text takes its place; `links` says how often that is done at most.
+/// component is a link, its text takes its place; `links` limits how often that happens.
 std::string _resolveExisting(std::string path, int links) {
     for (;; --links) {
         std::size_t const existing = _existingLength(path);
@@ -196,7 +196,7 @@ bool _equalAsWholes(File::Path const& a, File::Path const& b) {
 } // namespace
 
 bool operator==(File::Path const& a, File::Path const& b) {
-    // Not the overrides of a derived class: the conversion does not ask them either.
+    // Calls no overrides of a derived class: the conversion to text calls none either.
     std::wstring const* const parts[][2] = {
         {&a.File::Path::getVolume(), &b.File::Path::getVolume()},
         {&a.File::Path::getDirectory(), &b.File::Path::getDirectory()},

@@ -90,7 +90,7 @@ void rewrite(File& file, Content const& content) {
     file.File::close();
     try {
         // A file that cannot be deleted may still be writable. It is emptied, since opening it for
-        // update would keep what the old content has more than the new one.
+        // update would keep the end of an old content that is longer.
         if (!File::remove(wideName)) static_cast<void>(::truncate(name.c_str(), 0) == 0);
         file.File::open(mode);
     } catch (std::exception const&) {

@@ -42,7 +42,7 @@ void _encodeLength(std::size_t length, char* to) {
 void _decodeKey(char const* pairs, std::size_t size, wchar_t* to) {
     wchar_t* const end = to + size;
     for (; end - to >= 8; pairs += 16, to += 8) {
-        // Each pair twice in 32 bits; the shift leaves its second byte.
+        // Unpacking puts each pair twice into 32 bits; the shift leaves its second byte.
         __m128i const eight = load16(pairs);
         store16(to, _mm_srai_epi32(_mm_unpacklo_epi16(eight, eight), 24));
         store16(to + 4, _mm_srai_epi32(_mm_unpackhi_epi16(eight, eight), 24));
@@ -53,7 +53,7 @@ void _decodeKey(char const* pairs, std::size_t size, wchar_t* to) {
 /// Encodes each character as a zero and its low 8 bits.
 void _encodeKey(wchar_t const* key, std::size_t size, char* to) {
     wchar_t const* const end = key + size;
-    // The low 8 bits of each character as the high byte of 16 bits, which packing keeps.
+    // Moves the low 8 bits of each character to the high byte of 16 bits, which packing keeps.
     auto const four = [](wchar_t const* characters) {
         return _mm_srai_epi32(_mm_slli_epi32(load16(characters), 24), 16);
     };
@@ -189,7 +189,7 @@ public:
     }
 
 private:
-    /// How many bytes the buffer still takes: at least as many as asked for.
+    /// How many bytes the buffer still takes, which are not fewer than `least`.
     std::size_t room(std::size_t least) {
         if (BUFFER_SIZE - filled_ < least) flush();
         return BUFFER_SIZE - filled_;

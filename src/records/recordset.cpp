@@ -29,8 +29,8 @@ Fingerprint _fingerprint(std::wstring const& key) {
 /// allocated only for a new block and for the content of a record.
 ///
 /// At any time `records_` is in the order of addresses, and `numbers_` has the fingerprint of each
-/// at the same index. Of the slots before `used_` each has a record or is in `spare_`; those from
-/// `used_` on never had one.
+/// at the same index. Each slot before `used_` has a record or is in `spare_`; those from `used_`
+/// on never had one.
 class RecordSet::Block {
 public:
     explicit Block(std::size_t capacity) : capacity_(capacity) {
@@ -148,7 +148,7 @@ RecordSet::Record const* RecordSet::Cursor::next() {
 }
 
 RecordSet::Block& RecordSet::blockWithRoom() {
-    // There usually is room where the last record went.
+    // There is usually room where the last record went.
     if (last_ == nullptr || !last_->hasRoom()) last_ = &firstWithRoom();
     return *last_;
 }

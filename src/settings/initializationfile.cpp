@@ -39,9 +39,9 @@ std::string_view _sectionName(std::string_view line) {
 ///     value   = text
 ///     name    = text that neither begins with "[" nor ends with "]"
 ///
-/// and the first of these that fits. A header of brackets alone has its "[" for a name. An entry
-/// belongs to the section of the last header; before the first header, and where its key is empty,
-/// it is left out. (parseLines has dealt with the comments.)
+/// where the first alternative that fits counts. A header of brackets alone has its "[" for a name.
+/// An entry belongs to the section of the last header; before the first header, and where its key
+/// is empty, it is left out. (parseLines has dealt with the comments.)
 class Parser {
 public:
     explicit Parser(SettingsTable& table) : table_(table) {}

@@ -12,8 +12,8 @@
 
 namespace Koru {
 
-/// Calls `use(line)` for every line that is not empty. Only a line feed ends a line. So does the
-/// end of the file, but not a failure: the line that it cut short is left out.
+/// Calls `use(line)` for every line that is not empty. A line feed ends a line, and so does the end
+/// of the file, but not a failure: the line that it cut short is left out.
 template <class Use>
 void eachLine(FileBytes const& bytes, Use use) {
     char const* at = bytes.data.get();

@@ -32,8 +32,8 @@ std::wstring const& _section() { return _null_wstring; }
 ///     key     = text without "="
 ///     value   = text
 ///
-/// and the first of these that fits. An entry whose key is empty is left out. (parseLines has dealt
-/// with the comments.)
+/// where the first alternative that fits counts. An entry whose key is empty is left out.
+/// (parseLines has dealt with the comments.)
 void _parse(std::string_view line, bool plain, SettingsTable& list) {
     std::size_t const equals = line.find('=');
     if (equals == std::string_view::npos) return;

@@ -40,8 +40,8 @@ StoredText SettingsTable::view(std::string_view bytes) {
     return viewDecoded(text);
 }
 
-/// Malformed text becomes the bytes of what it decodes to, in its place: no character takes more of
-/// them than it was decoded from. A wide string for each text took 25 times the size of the file.
+/// Replaces malformed text, in its place, by the encoding of what it decodes to, which is never
+/// longer. Keeping a wide string for each such text took 25 times the size of the file.
 StoredText SettingsTable::viewDecoded(std::string_view text) {
     std::string const bytes = make_string(make_wstring(text.data(), text.size()));
     char* const place = bytes_.data.get() + (text.data() - bytes_.data.get());
@@ -94,7 +94,7 @@ std::size_t SettingsTable::find(std::wstring const& section, std::wstring const&
     auto const isAt = [this, &matches, &key](std::size_t i) {
         return matches(entries_[i]) && areEqual(entries_[i].key, key);
     };
-    constexpr std::size_t few = 4; // They are compared sooner than the column is made.
+    constexpr std::size_t few = 4; // Comparing these is faster than making the column.
     if (entries_.size() > few && entries_.size() != fingerprints_.size()) completeFingerprints();
     if (!fingerprints_.empty()) {
         // An empty name, as a flat file's section has it, mixes to 0.
@@ -231,7 +231,7 @@ void SettingsTable::dropUnusedSections() {
     std::vector<std::uint32_t> numbers(sections_.size(), NO_SECTION); // by the old number
     std::vector<StoredText> used;
     used.reserve(entries_.size());
-    // Entries before this one have new numbers, the others old ones. Of each section seen so far
+    // Entries before this one have new numbers, the others old ones. For each section seen so far,
     // `numbers` has the new number, and `used` has the name at that number.
     for (Entry& entry : entries_) {
         std::uint32_t& number = numbers[entry.section];

@@ -130,7 +130,7 @@ private:
     std::deque<std::wstring> strings_; // the held strings
     std::vector<std::wstring*> spare_; // those of them that were released
 
-    // Those of the first entries and of the first section names: of as many as there were when a
+    // The fingerprints of the first entries and section names, of as many as there were when a
     // look-up last needed them and had memory for them.
     std::vector<Fingerprint> fingerprints_;
     std::vector<std::uint32_t> sectionFingerprints_;

@@ -7,7 +7,7 @@
 namespace Koru {
 
 std::wstring StoredText::str() const {
-    constexpr std::size_t few = 64; // Widening more of them at a time is worthwhile beyond it.
+    constexpr std::size_t few = 64; // Beyond it, widening several at a time is worthwhile.
     if (isWide()) return wideString(wide_->data(), wide_->size());
     if (size_ <= few && isPlain(bytes())) return std::wstring(bytes_, bytes_ + size_);
     return make_wstring(bytes_, size_);
@@ -15,7 +15,7 @@ std::wstring StoredText::str() const {
 
 namespace {
 
-/// All else. Apart, so that what mostly decides does without what this takes.
+/// Decides the rarer cases. A function of its own, so that the usual ones do without its stack.
 __attribute__((noinline)) int _compareFolded(StoredText const& a, StoredText const& b) {
     return a.withCursor(
         [&b](auto x) { return b.withCursor([&x](auto y) { return compareFolded(x, y); }); });
@@ -30,7 +30,7 @@ int compare(StoredText const& a, StoredText const& b) {
     std::size_t const i = firstDifference(x, y);
     if (i == y.size()) return i == x.size() ? 0 : 1;
     if (i == x.size()) return -1;
-    // Mostly the first two characters that differ decide.
+    // Usually the first two characters that differ decide.
     bool const decided = isUndisputed(x[i]) && isUndisputed(y[i]) && lower(x[i]) != lower(y[i]);
     return decided ? static_cast<int>(lower(x[i]) - lower(y[i])) : _compareFolded(a, b);
 }
@@ -45,7 +45,7 @@ __attribute__((noinline)) bool _areEqualFolded(StoredText const& a, std::wstring
 } // namespace
 
 bool areEqual(StoredText const& a, std::wstring const& b) {
-    // Mostly a name is looked for as it is written.
+    // Usually a caller spells a name as the file does.
     if (!a.isWide() && a.bytes().size() == b.size() &&
         areSameAscii(a.bytes().data(), b.data(), b.size()))
         return true;

@@ -1,9 +1,9 @@
 // How a settings table keeps its text.
 //
 // Opening a file makes three strings of every line, and most programs look at few of them. So text
-// from a file stays where it was read, as bytes, and is widened when somebody asks for it. These are
-// just the bytes that make_string gives for its characters; where the file has others, they have
-// been replaced. What callers set is kept as a wide string.
+// from a file stays where it was read, as bytes, and is widened when somebody asks for it. The
+// bytes are always those that make_string gives for the characters; where the file has others, they
+// have been replaced. What callers set is kept as a wide string.
 #ifndef KORU_SETTINGS_STOREDTEXT_H
 #define KORU_SETTINGS_STOREDTEXT_H
 

@@ -10,7 +10,7 @@
 
 namespace Koru {
 
-/// For each mask of eight bits, where the bits that are set are, lowest first, and how many.
+/// For each mask of eight bits, the places of its set bits, lowest first, and their number.
 struct Compression {
     std::array<std::array<std::uint8_t, 8>, 256> places{};
     std::array<std::uint8_t, 256> kept{};

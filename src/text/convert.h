@@ -12,8 +12,8 @@ namespace Koru {
 /// Decodes the bytes up to the first zero byte or the end, as make_wstring(std::string) does.
 std::wstring make_wstring(char const* s, std::size_t size);
 
-/// A string of these characters. One that is copied from them takes 35 ns on i386 however few they
-/// are: wmemcpy, which strings copy with, is there the one for the oldest processors.
+/// A string of these characters. Constructing it from them would take 35 ns on i386 however few
+/// they are: strings copy with wmemcpy, which there is the version for the oldest processors.
 std::wstring wideString(wchar_t const* s, std::size_t size);
 
 /// The number of bytes that `encode` writes for the characters at the most.

@@ -69,8 +69,8 @@ Decoding _decodeAscii(Decoding at, char const* end, wchar_t const* full) {
 // continuation bytes are dropped by compressing the others. So nothing branches on the text, and no
 // character has to be decoded before the next one is found.
 
-/// Writes those of eight 16-bit values that the lowest bits of `keep` tell, and returns the end of
-/// what was written.
+/// Writes those of eight 16-bit values that the lowest bits of `keep` select, and returns the end
+/// of what was written.
 __attribute__((target("ssse3"))) wchar_t* _compress8(__m128i values, std::uint32_t keep,
                                                      wchar_t* to) {
     keep &= 0xFF;

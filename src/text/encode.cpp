@@ -78,7 +78,7 @@ Encoding _encodeAscii(Encoding at, wchar_t const* end, char const* last) {
 // Each character is spread over as many bytes as the longest of them has; a shorter one begins with
 // zeros. Compressing drops the zeros.
 
-/// Writes those of the lower eight bytes that the lowest bits of `keep` tell, and returns the end
+/// Writes those of the lower eight bytes that the lowest bits of `keep` select, and returns the end
 /// of what was written.
 __attribute__((target("ssse3"))) inline char* _compress8(__m128i bytes, std::uint32_t keep,
                                                          char* to) {
@@ -214,7 +214,7 @@ __m128i _furtherBytesOfStep(wchar_t const* s) {
     return _mm_madd_epi16(sixteen, _mm_set1_epi16(1));
 }
 
-/// Whether a step holds a NUL. A negative character is narrowed to 0 as well, but is none.
+/// Whether a step holds a NUL. A negative character is narrowed to 0 as well, but is not one.
 bool _holdsNul(wchar_t const* s) {
     bool const may = highBits(_mm_cmpeq_epi8(narrow16(s), _mm_setzero_si128())) != 0;
     return may && std::find(s, s + STEP, L'\0') != s + STEP;
@@ -226,7 +226,7 @@ bool _holdsNul(wchar_t const* s) {
 [[gnu::force_align_arg_pointer]] std::size_t encodedBound(wchar_t const* s, std::size_t size) {
     wchar_t const* const start = s;
     wchar_t const* const end = s + size;
-    // Most texts are ASCII, which alone takes half as long as in the loop below.
+    // Most texts are ASCII, for which this takes half as long as the loop below.
     while (end - s >= STEP && areAscii(narrow16(s))) s += STEP;
     __m128i further = _mm_setzero_si128();
     for (; end - s >= STEP; s += STEP) {

@@ -12,8 +12,8 @@ namespace Koru {
 
 namespace {
 
-/// Passes over steps of 64 numbers that are all others, with vectors twice as wide, and returns how
-/// far it came.
+/// Passes over steps of 64 numbers without the wanted one, with vectors twice as wide, and returns
+/// how far it came.
 __attribute__((target("avx2"))) std::size_t _pass(Fingerprint const* numbers, std::size_t size,
                                                   Fingerprint wanted, std::size_t from) {
     __m256i const pattern = _mm256_set1_epi16(static_cast<short>(wanted));
@@ -33,8 +33,8 @@ __attribute__((target("avx2"))) std::size_t _pass(Fingerprint const* numbers, st
     return i;
 }
 
-/// The position of the first of two numbers. Inlined by force: where they are the same, half of the
-/// comparisons fall away.
+/// The position of the first of two numbers. Inlined by force: where they are the same, the
+/// compiler drops half of the comparisons.
 [[gnu::always_inline]] inline std::size_t _find(std::vector<Fingerprint> const& column,
                                                 Fingerprint wanted, Fingerprint orThis,
                                                 std::size_t from) {
@@ -73,8 +73,8 @@ std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint 
 
 namespace {
 
-/// How many characters of a name count. That names which differ only after them have one number
-/// costs comparisons, no more.
+/// How many characters of a name count. Names that differ only after them share a number, which
+/// just costs comparisons.
 constexpr std::size_t MOST = 256;
 
 /// `classOf` for sixteen characters of ASCII.
@@ -84,7 +84,7 @@ __m128i _classesOf(__m128i characters) {
     return _mm_xor_si128(lower, _mm_and_si128(isK, _mm_set1_epi8(SMALL_K ^ SMALL_I)));
 }
 
-/// The highest bit of each byte tells whether `narrow16` met something else than a character of
+/// The highest bit of each byte tells whether `narrow16` met something other than a character of
 /// ASCII, or NUL. There is no NUL in bytes.
 __m128i _isOdd(char const*, __m128i narrowed) { return narrowed; }
 __m128i _isOdd(wchar_t const*, __m128i narrowed) {
@@ -92,7 +92,7 @@ __m128i _isOdd(wchar_t const*, __m128i narrowed) {
 }
 
 /// A number from the classes of characters of ASCII, each with a weight that its place gives it.
-/// Inlined by force: kept apart, as the compiler may, it takes a quarter more.
+/// Inlined by force: the compiler might not do so by itself, and then it takes a quarter longer.
 class Sum {
 public:
     template <class Char>
@@ -104,14 +104,14 @@ public:
             add(name, narrowAll(name, size));
     }
 
-    /// Whether all were characters of ASCII, and not NUL. The sum is good for nothing otherwise.
+    /// Whether all were characters of ASCII, and not NUL. Otherwise the sum means nothing.
     bool isExact() const { return highBits(odd_) == 0; }
 
     std::uint32_t mixedInto(std::uint32_t before) const {
         __m128i const two = _mm_add_epi32(sum_, _mm_unpackhi_epi64(sum_, sum_));
         __m128i const one = _mm_add_epi32(two, _mm_srli_epi64(two, 32));
         auto const sum = static_cast<std::uint32_t>(_mm_cvtsi128_si32(one));
-        // Odd numbers at random; the last one spreads what differs to the high bits.
+        // Odd numbers chosen at random; the last one spreads what differs to the high bits.
         std::uint32_t const mixed = before * 0x85EBCA6BU + size_ * 0xC2B2AE35U + sum;
         return (mixed ^ mixed >> 15) * 0x9E3779B1U;
     }
@@ -125,7 +125,7 @@ private:
         addBehind(name, narrow16(name + size - 16));
     }
 
-    /// So that the order of sixteens counts.
+    /// Shifts the sum first, so that the order of the sixteens counts.
     template <class Char>
     void addBehind(Char const* name, __m128i characters) {
         sum_ = _mm_add_epi32(sum_, _mm_slli_epi32(sum_, 5));
@@ -148,8 +148,8 @@ private:
 bool _continues(char c) { return isContinuation(c); }
 bool _continues(wchar_t) { return false; }
 
-/// The number of a name that is not all ASCII or holds a NUL. Apart, so that others do without the
-/// memory that it takes.
+/// The number of a name that is not all ASCII or holds a NUL. A function of its own, so that other
+/// names do without the memory that it takes.
 template <class Char>
 [[gnu::noinline]] std::uint32_t _mixClasses(std::uint32_t before, Char const* name,
                                             std::size_t size) {

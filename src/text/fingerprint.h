@@ -28,14 +28,14 @@ std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint 
 
 /// What a character other than NUL counts as. Two that some locale pairs count as the same: the
 /// letters of ASCII as their lower case, but those that are paired with characters beyond ASCII
-/// (see DisputedLetter) as one with all of these. That some other characters of ASCII count as the
-/// same, too, only costs comparisons.
+/// (see DisputedLetter) as one with all of these. Some other characters of ASCII count as the same,
+/// too, which only costs comparisons.
 constexpr std::uint32_t classOf(std::uint32_t c) {
     return c >= 0x80 || (c | 0x20) == SMALL_K ? std::uint32_t{SMALL_I} : c | 0x20;
 }
 
 /// Mixes a name into the number of the name before it. Bytes are well-formed UTF-8 without a NUL;
-/// wide text ends at its first NUL. A name has the same number as bytes as it has wide.
+/// wide text ends at its first NUL. A name has the same number as bytes and as wide text.
 std::uint32_t mixFingerprint(std::uint32_t before, char const* name, std::size_t size);
 std::uint32_t mixFingerprint(std::uint32_t before, wchar_t const* name, std::size_t size);
 

@@ -16,7 +16,7 @@ enum DisputedLetter : std::uint8_t {
     SMALL_K = 'k',   ///< also the lower case of the Kelvin sign, U+212A
 };
 
-/// Whether every locale lowers a character as ASCII has it. It does not matter here what else is
+/// Whether every locale lowers a character as ASCII does. It does not matter here what else is
 /// lowered to the same.
 inline bool isUndisputed(wchar_t c) { return static_cast<wint_t>(c) < 0x80 && c != CAPITAL_I; }
 

@@ -23,10 +23,10 @@ void _setBad(std::ostream& os) {
     }
 }
 
-/// Hands the characters up to `last` and that one to the buffer, at once but with the outcome of
-/// one by one: the first that fails makes the stream bad, and the next after that makes it fail.
+/// Hands the characters up to `last` and that one to the buffer, at once but with the same outcome
+/// as one by one: the first that fails makes the stream bad, and the one after it makes it fail.
 void _passThrough(std::ostream& os, char const* s, char const* last) {
-    bool onlyLast = false; // is left to be put
+    bool onlyLast = false; // whether it alone is left to be put
     auto const put = [&] {
         onlyLast = os.rdbuf()->sputn(s, last - s) == last - s;
         if (onlyLast && os.rdbuf()->sputc(*last) != std::char_traits<char>::eof()) return;

@@ -1,4 +1,4 @@
-// The characters of a name in a byte each, of bytes as of wide text, several at a time.
+// The characters of narrow or wide text, in a byte each, several at a time.
 #ifndef KORU_TEXT_NARROW_H
 #define KORU_TEXT_NARROW_H
 
@@ -104,8 +104,8 @@ inline std::size_t firstDifference(std::string_view a, std::string_view b) {
     return i;
 }
 
-/// Writes the low 8 bits of each character, which are all of it in such a text, and returns the end
-/// of what was written.
+/// Writes the low 8 bits of each character, which are all of it in ASCII, and returns the end of
+/// what was written.
 inline char* narrow(wchar_t const* s, std::size_t size, char* to) {
     __m128i const byte = _mm_set1_epi32(0xFF);
     auto const four = [s, byte](std::size_t i) { return _mm_and_si128(load16(s + i), byte); };

@@ -18,7 +18,7 @@
 
 namespace Koru {
 
-// First of all objects of the library, since every other one may ask for them.
+// Constructed before all other objects of the library, since any of these may ask for them.
 __attribute__((init_priority(101))) std::string const _null_string;
 __attribute__((init_priority(101))) std::wstring const _null_wstring;
 
@@ -67,8 +67,8 @@ struct FourPairs {
     __m128i disputed; ///< not zero where I and i meet, among those that are the same
 };
 
-/// Compares texts whose first characters differ. Apart, since most comparisons end before and then
-/// do without the stack that this takes.
+/// Compares texts whose first characters differ. A function of its own, since most comparisons end
+/// before it and then do without its stack.
 [[gnu::noinline]] int _compareCases(wchar_t const* a, wchar_t const* b, std::size_t size) {
     __m128i const zero = _mm_setzero_si128();
     __m128i disputed = zero;
@@ -102,9 +102,9 @@ int compare(std::wstring const& a, std::wstring const& b) {
     return _compareCases(x + i, y + i, size - i);
 }
 
-// What is too long for any string is want of memory too: callers have one failure to know.
+// Text too long for any string counts as a lack of memory: callers have one failure to know.
 std::wstring wideString(wchar_t const* s, std::size_t size) try {
-    constexpr std::size_t worthwhile = 128; // Beyond it, to fill the string first takes longer.
+    constexpr std::size_t worthwhile = 128; // Beyond it, filling the string first takes longer.
     if (size > worthwhile) return std::wstring(s, size);
     std::wstring result(size, L'\0');
     std::copy(s, s + size, result.begin());
@@ -125,15 +125,15 @@ std::basic_string<Char> _copy(Char const* s, std::basic_string<Char> const& noth
     throw std::bad_alloc();
 }
 
-/// Whether a text is ASCII without a NUL and no longer than most names. For that a block is not
-/// worth its while.
+/// Whether a text is ASCII without a NUL and no longer than most names. For such text a block is
+/// not worthwhile.
 template <class Char>
 bool _isPlainName(Char const* s, Char const* end) {
     return end - s < 16 && std::all_of(s, end, [](Char c) { return c > 0 && c <= 0x7F; });
 }
 
 /// Converts a text. `convertBlock` is decodeBlock or encodeBlock; `bound` tells how many units are
-/// to be reserved. Inlined by force: short texts would pay for a further call.
+/// to be reserved. Inlined by force: short texts would suffer from a further call.
 template <class In, class Out, class ConvertBlock, class Bound>
 [[gnu::always_inline]] inline std::basic_string<Out>
 _convert(In const* s, In const* end, std::basic_string<Out> const& nothing,

@@ -1,4 +1,4 @@
-// What is asked of bytes before they are kept in place of the characters they decode to.
+// Whether bytes may be kept in place of the characters they decode to.
 #ifndef KORU_TEXT_WELLFORMED_H
 #define KORU_TEXT_WELLFORMED_H
 
@@ -15,7 +15,7 @@ namespace Koru {
 inline bool isPlain(std::string_view bytes) { return isAscii(bytes.data(), bytes.size()); }
 
 /// Whether make_string gives these bytes for what make_wstring makes of them. May be false for
-/// characters beyond four bytes, of which no text consists.
+/// characters of more than four bytes, which no real text has.
 inline bool isCanonical(std::string_view bytes) {
     constexpr std::array<wchar_t, 5> leastOfSize = {0, 0x01, 0x80, 0x800, 0x10000};
     char const* at = bytes.data();

@@ -20,7 +20,7 @@ constexpr int SECONDS_PER_HOUR = 3600;
 std::int16_t _offsetHours(std::time_t moment) {
     std::tm* const utc = std::gmtime(&moment);
     if (utc == nullptr) return 0;
-    // In 64 bits: near the limits of time_t mktime may fail, and the difference may not fit.
+    // On 64 bits: near the limits of time_t mktime may fail, and the difference may not fit.
     std::int64_t const difference = std::int64_t{moment} - std::int64_t{std::mktime(utc)};
     return static_cast<std::int16_t>(difference / SECONDS_PER_HOUR);
 }
