@@ -19,7 +19,7 @@ int main() {
     other.join();
     std::cout << count << '\n';
 
-    // The thread that has it may lock it again; others wait, if they like for a while only.
+    // The thread that has it may lock it again; others wait, and may give up after a while.
     std::lock_guard<Koru::Mutex> const first(mutex);
     std::lock_guard<Koru::Mutex> const second(mutex);
     std::thread([&mutex] {

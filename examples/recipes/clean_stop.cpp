@@ -37,7 +37,7 @@ int main() {
 
     Worker worker;
     if (!worker.start(nullptr)) return 1;
-    kill(getpid(), SIGTERM); // In life, somebody else sends it.
+    kill(getpid(), SIGTERM); // In real life, somebody else sends it.
     int signal = 0;
     sigwait(&signals, &signal);
     worker.stop();

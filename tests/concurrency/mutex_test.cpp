@@ -289,7 +289,7 @@ TEST_CASE("a copy of a free mutex is a free recursive mutex of its own") {
     follow(copy, "unlock held unlock free");
 }
 
-TEST_CASE("a copy of a held mutex is held too, by the same thread and as often") {
+TEST_CASE("a copy of a held mutex is held too, by the same thread the same number of times") {
     Mutex mutex;
     follow(mutex, "lock lock");
     Mutex copy(mutex);

@@ -177,7 +177,7 @@ TEST_CASE("a child that calls exit writes out what its parent had buffered, as t
     CHECK(place.text() == "line\nline\n");
 }
 
-TEST_CASE("a child has lost the lock that the thread held which forked it") {
+TEST_CASE("a child has lost the lock that the forking thread held") {
     Koru::Mutex mutex;
     mutex.lock();
     test::Outcome const outcome = test::inChild([&] {

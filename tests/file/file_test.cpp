@@ -633,7 +633,7 @@ TEST_CASE_FIXTURE(OnRecorder, "synchronize leaves a closed file as it is") {
 }
 
 TEST_CASE_FIXTURE(OnRecorder,
-                  "synchronize opens in the mode that setMode left, read-only for one") {
+                  "synchronize opens in the mode that setMode left, such as read-only") {
     recorder.File::open(UPDATE);
     recorder << "CON" << std::flush;
     recorder.setMode(READ);

@@ -124,7 +124,7 @@ TEST_CASE("opening for writing alone empties a large file") {
     CHECK(large.size() == 0);
 }
 
-TEST_CASE("a large file is found, renamed, created anew and removed") {
+TEST_CASE("a large file is found, renamed, recreated and removed") {
     LargeFile const large(5 * GIB);
     if (!large.isThere) return;
     std::wstring const other = large.wide() + L"2";
