@@ -30,7 +30,7 @@ step() {
 }
 
 # Shows that a step is alive: the last line of its output on a terminal, dots elsewhere.
-# The sleep has no part in our output, which a reader of a pipe would otherwise wait for.
+# The sleep does not keep our output open, or a reader of a pipe would wait for it.
 _follow() {
     local label=$1 log=$2 line
     while true; do
