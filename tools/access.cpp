@@ -117,7 +117,7 @@ std::vector<Entry> _rewrite(Family const& family, fs::path const& path,
     return entries;
 }
 
-/// Copies what the change begins with.
+/// Copies the file that the change begins with, unless it begins with an empty table.
 void _copy(Family const& family, fs::path const& path, fs::path const& fresh, Options options) {
     if (options.isToReplace) return;
     fs::copy_file(path, fresh);
@@ -125,8 +125,8 @@ void _copy(Family const& family, fs::path const& path, fs::path const& fresh, Op
     if (isText && !options.mayLose) refuseLoss(readAll(fresh), family.hasSections);
 }
 
-/// Gives the new file the owner and the permissions of the old one; another owner where only root
-/// may give files away, but no other group.
+/// Gives the new file the permissions, the group and, where the system lets us, the owner of the
+/// old one.
 void _takeOver(fs::path const& old, fs::path const& fresh) {
     struct stat status = {};
     if (::stat(old.c_str(), &status) != 0) failBySystem("cannot tell its permissions");

@@ -11,14 +11,14 @@
 
 namespace tool {
 
-/// The path for the library, which takes it as it is. A parsed path could be no file directly below
-/// the root and none with a backslash in its name.
+/// The path for the library, which takes it as it is. A parsed path could name neither a file
+/// directly below the root nor one with a backslash in its name.
 Koru::File::Path verbatim(std::filesystem::path const& path);
 
-/// What is in a file, which counts from the working directory. Creates and changes nothing.
+/// The entries of a file, whose path starts at the working directory. Creates and changes nothing.
 std::vector<Entry> read(Family const& family, std::string const& file);
 
-/// What a change may do, or does, besides.
+/// What else a change may do, or does.
 struct Options {
     bool mayCreate = false;   ///< the file, if it is missing
     bool mayLose = false;     ///< lines that the library ignores, or would write otherwise

@@ -26,7 +26,7 @@ Entry const& _find(Family const& family, std::vector<Entry> const& entries, Entr
     return *found;
 }
 
-/// Of the entries, those of the section.
+/// The entries of the section.
 std::vector<Entry> _ofSection(std::vector<Entry> entries, std::string const& section) {
     entries.erase(std::remove_if(entries.begin(), entries.end(),
                                  [&](Entry const& entry) {
@@ -63,7 +63,7 @@ Options _creating(Arguments const& arguments) {
     return options;
 }
 
-/// A value that is not among the arguments is in standard input, there as a line.
+/// A value that is not among the arguments comes from standard input, as a line.
 std::string _value(Arguments const& arguments) {
     if (arguments.value) return arguments.isRaw ? _digits(*arguments.value) : *arguments.value;
     std::string const input = readAll("-");

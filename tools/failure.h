@@ -30,7 +30,7 @@ private:
 /// Throws what `errno` says, after the words that tell what was tried.
 [[noreturn]] void failBySystem(std::string const& attempt);
 
-/// Of the exception that is being handled: a `Failure`, which is about `file` if it is about none.
+/// The exception that is being handled, as a `Failure`; it is about `file` if it was about none.
 Failure currentFailure(std::string const& file);
 
 /// Calls `action`, whose exceptions become failures with `file`.

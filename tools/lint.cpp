@@ -40,7 +40,7 @@ public:
         }
         checkSectionHasEntries();
         std::stable_sort(report_.findings.begin(), report_.findings.end(), [](auto& a, auto& b) {
-            return a.line < b.line; // Those of headers without entries come late.
+            return a.line < b.line; // Headers without entries are found late.
         });
         return report_;
     }

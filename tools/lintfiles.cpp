@@ -7,7 +7,7 @@ namespace tool {
 
 namespace {
 
-/// What every save drops, which is as it has to be.
+/// What every save drops: that is intended and no finding.
 std::string _note(Report const& report) {
     if (report.comments + report.blanks == 0) return "";
     return "note: a save drops comments (" + std::to_string(report.comments) +

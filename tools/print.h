@@ -17,7 +17,7 @@ std::string exported(Family const& family, std::vector<Entry> const& entries, Fo
 /// The names only, a line each: keys, or where the entries have no key, sections.
 std::string listed(std::vector<Entry> const& entries, Format format);
 
-/// What `exported` wrote.
+/// Reads what `exported` wrote.
 /// @throws Failure when it is something else
 std::vector<Entry> parse(Family const& family, std::string const& bytes, Format format);
 

@@ -1,5 +1,5 @@
-// What a settings file or a property file gives back as it was set: both are lines of text, in
-// which nothing is escaped.
+// Whether a settings file or a property file gives text back as it was set: both consist of lines
+// in which nothing is escaped.
 #ifndef KORU_TOOLS_STORABLE_H
 #define KORU_TOOLS_STORABLE_H
 

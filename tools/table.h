@@ -39,15 +39,15 @@ public:
 
     /// The file, to open and close.
     virtual Koru::File& file() = 0;
-    /// What is in it. Of several settings with one name, that which counts; of records, all.
+    /// Its entries: of several settings with one name, only the one that counts; of records, all.
     virtual std::vector<Entry> entries() = 0;
-    /// Sets the value, for a name that is there too.
+    /// Sets the value, also of a name that is already there.
     virtual void set(Entry const& entry) = 0;
     /// Removes all that has the entry's name, duplicates too; without a key, the whole section.
     virtual void remove(Entry const& name) = 0;
 };
 
-/// A kind of files.
+/// A kind of file.
 struct Family {
     char const* name;      ///< its subcommand
     char const* item;      ///< what one of it is called
@@ -63,7 +63,7 @@ extern Family const SETTINGS;
 extern Family const PROPERTIES;
 extern Family const RECORDS;
 
-/// Of entries with the same name the first.
+/// The first of the entries with each name.
 std::vector<Entry> firstOfEach(std::vector<Entry> const& entries);
 
 } // namespace tool

@@ -8,7 +8,7 @@
 namespace tool {
 
 /// The text for the library.
-/// @throws Failure when the library would not give the same text back: no UTF-8, or with a NUL
+/// @throws Failure when the library would not give the same text back: not UTF-8, or with a NUL
 std::wstring wide(std::string const& text);
 
 /// The library's text, in UTF-8.
