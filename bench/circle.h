@@ -1,4 +1,4 @@
-// Things that a work takes one after the other.
+// Things that a piece of work takes one after the other.
 #ifndef KORU_BENCH_CIRCLE_H
 #define KORU_BENCH_CIRCLE_H
 

@@ -1,9 +1,9 @@
 // Record files: write, load, look-up by position and inserts, with records of 100 bytes.
 //
 // What is compared: our records have wide keys that match without regard to case. The peers match
-// exactly, which is less work; from and to wide keys they convert as convert.h has it. None of them
-// is told to bring the data to a disk, since we do not either. Writing replaces the file
-// and gives the memory of the records back, as our close does.
+// exactly, which is less work; they convert from and to wide keys as convert.h does. None of them
+// is told to bring the data to a disk, since we do not either. Writing replaces the file and gives
+// the memory of the records back, as our close does.
 #include <koru/datafile.h>
 
 #include <unistd.h>

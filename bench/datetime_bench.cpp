@@ -196,7 +196,7 @@ void _fromEpoch(bench::Report& report, Moments const& moments) {
         {bench::limit("localtime", localtime), bench::limit("its C library calls", calls, 1.05)});
 }
 
-/// Pairs a moment with one that is so many seconds later.
+/// Pairs a moment with one this many seconds later.
 void _compare(bench::Report& report, std::string const& row, Moments const& moments, long later,
               bool conversions) {
     struct Pair {

@@ -19,9 +19,9 @@
 
 namespace bench {
 
-/// Someone to be compared with. Of the peers for one job the fastest is the one that the job's goal
-/// speaks of; a limit (the same bytes through the cheapest primitive, or something that does a part
-/// of the job) has a goal of its own.
+/// Someone to be compared with. The goal of a job refers to the fastest of its peers; a limit (the
+/// same bytes through the cheapest primitive, or something that does a part of the job) has a goal
+/// of its own.
 struct Peer {
     std::string name;
     Work work;            ///< empty when this machine lacks the library

@@ -2,7 +2,7 @@
 //
 // What is compared: our names and values are wide at the interface, names match without regard to
 // case, and the order of the lines is kept. "unordered_map" is what one writes by hand, with
-// getline and an ofstream, when none of that is asked for: narrow text, exact case, any order. With
+// getline and an ofstream, when none of that is needed: narrow text, exact case, any order. With
 // wide names and values it is a limit.
 #include <koru/propertyfile.h>
 

@@ -65,7 +65,7 @@ std::size_t _encodedSize(wchar_t c) {
     return c < 0x80 ? 1U : c < 0x800 ? 2U : c < 0x10000 ? 3U : 4U;
 }
 
-/// Text of at most so many UTF-8 bytes and characters, as much as fits. Which word comes next
+/// Text of at most this many UTF-8 bytes and characters, as much as fits. Which word comes next
 /// cannot be foreseen, or branch prediction would learn the text by heart.
 std::wstring _text(Script const& script, std::size_t maxBytes, std::size_t maxCharacters) {
     std::mt19937 random(1);
@@ -105,7 +105,8 @@ private:
     iconv_t handle_;
 };
 
-/// The functions of the C library that convert by locale see one that says UTF-8; no other does.
+/// The functions of the C library that convert by locale see one that says UTF-8; no other
+/// function does.
 Work _inUtf8Locale(Work const& work) {
     return work.within([] { std::setlocale(LC_CTYPE, "C.UTF-8"); },
                        [] { std::setlocale(LC_CTYPE, "C"); });

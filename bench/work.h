@@ -18,7 +18,7 @@ void keep(T const& object) {
     asm volatile("" : : "r"(&object) : "memory");
 }
 
-/// Ends the program unless all agree: a peer that does something else is no measure.
+/// Ends the program unless all agree: a peer that does something else measures nothing.
 inline void require(bool condition, char const* what) {
     if (condition) return;
     std::fprintf(stderr, "bench: %s\n", what);
@@ -87,7 +87,7 @@ public:
         });
     }
 
-    /// The seconds that so many runs took.
+    /// The seconds that this many runs took.
     double time(std::size_t count) const { return time_(count); }
 
     explicit operator bool() const { return static_cast<bool>(time_); }

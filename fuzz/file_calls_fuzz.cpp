@@ -49,7 +49,7 @@ std::string contentOf(std::wstring const& name) {
     return {std::istreambuf_iterator<char>(file), {}};
 }
 
-/// What a copy leaves is no content, but where a pointer was.
+/// What a copy leaves is not content, but where a pointer was.
 bool isPointerText(std::string const& text) {
     return !text.empty() && text.find_first_not_of("0123456789abcdefx") == std::string::npos;
 }

@@ -31,8 +31,7 @@ namespace {
 
 bool clockFails = false;
 
-/// What the timed wait of the C library is asked for in a thread, and what it shall answer there
-/// instead of waiting.
+/// What a thread asks of the C library's timed wait, and what that is to answer instead of waiting.
 struct TimedWait {
     static int const WAITS = -1;
     int answer = WAITS;
@@ -45,8 +44,8 @@ thread_local TimedWait timedWait;
 
 } // namespace
 
-// These come before the C library's functions, so that tests see the deadline and let the wait
-// fail.
+// These come before the C library's functions, so that tests see the deadline and make the
+// wait fail.
 extern "C" int gettimeofday(timeval* now, void* zone) noexcept {
     if (!clockFails) return static_cast<int>(::syscall(SYS_gettimeofday, now, zone));
     errno = EOVERFLOW;

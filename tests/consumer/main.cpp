@@ -1,5 +1,6 @@
 // An application that uses the library the way its own build found it: writes a setting, reads it
-// back through a second object and fails when it is another. In C++11, the oldest that is served.
+// back through a second object and fails when it differs. In C++11, the oldest version that
+// is supported.
 #include <iostream>
 #include <string>
 

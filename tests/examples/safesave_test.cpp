@@ -23,7 +23,7 @@ std::string content(int entries, std::string const& value) {
     return result;
 }
 
-/// Sets `a` to "new", but is killed at a system call; false if it makes no so many.
+/// Sets `a` to "new", but is killed at a system call; false if it makes fewer calls.
 bool savedUntil(long call, Place const& place) {
     return test::killedAtCall(call, [&place] {
         // The search for leaks traces the program itself, so it fails where that is traced already.

@@ -1,5 +1,5 @@
-// The sweep of failing system calls once more, from outside: strace lets each call fail that a
-// scenario makes, whichever function of the C library makes it. Not one of the tests:
+// The sweep of failing system calls once more, from outside: strace makes each call of a
+// scenario fail, whichever function of the C library makes it. Not one of the tests:
 // proof/injection runs it.
 //
 //     injection PART PARTS         every PARTS-th scenario, from PART on
@@ -94,7 +94,7 @@ struct Range {
 };
 using Ranges = std::map<std::string, Range>;
 
-/// Of a line "PID  NAME(ARGUMENTS" the name, if the process is the first one.
+/// The name in a line "PID  NAME(ARGUMENTS", if the process is the first one.
 std::string nameIn(std::string const& line, std::string& first) {
     std::istringstream in(line);
     std::string process;
@@ -137,7 +137,7 @@ std::string complaintAbout(Outcome const& outcome, Result const& undisturbed, bo
     return test::complaintAbout(told.result, undisturbed);
 }
 
-/// Lets each call of one name fail in turn. Returns how many faults there were.
+/// Makes each call of one name fail in turn. Returns how many faults there were.
 long failEach(std::size_t number, std::string const& name, Range const& range,
               Result const& undisturbed, long& complaints) {
     test::TempDir const directory;

@@ -77,7 +77,7 @@ constexpr unsigned long READ_MODE = Koru::File::READ;
 constexpr unsigned long WRITE_MODE = Koru::File::WRITE;
 constexpr unsigned long UPDATE_MODE = READ_MODE | WRITE_MODE;
 
-/// Each scenario of a structured file with so many entries and values of this size.
+/// Each scenario of a structured file with this many entries and values of this size.
 template <class Family>
 void addStructured(std::vector<Scenario>& scenarios, int entries, std::size_t size) {
     using File = typename Family::File;

@@ -88,7 +88,7 @@ struct Stored : Place {
 
     void restore() const { writeFile(path, old); }
     bool isOld() const { return content() == old; }
-    /// Whether it holds one entry more than at first, or so many of them.
+    /// Whether it holds one entry more than at first, or this many.
     bool isNew(int count = COUNT + 1) const { return test::isWhole<Family>(content(), 0, count); }
     /// The file, opened and with one entry more.
     std::unique_ptr<File> changed() const {
@@ -227,7 +227,7 @@ TEST_CASE_TEMPLATE("close that cannot create the new file through a stream write
                 auto const file = stored.changed();
                 FailingCall const fault(Call::OPEN, error, before);
                 FailingCall const createdLate(Call::DESCRIPTOR, EINTR);
-                FailingCall const interruption(Call::WRITE, EINTR); // is no end of the content
+                FailingCall const interruption(Call::WRITE, EINTR); // does not end the content
                 CHECK(complaint([&] { file->close(); }) == NOT_OPENED);
             }
             CHECK(stored.isNew());

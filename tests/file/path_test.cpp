@@ -106,7 +106,7 @@ Path pathOf(std::wstring const& volume, std::wstring const& directory, std::wstr
     return path;
 }
 
-/// Every text of one to so many of the pieces, with the separator between them.
+/// Every text of one piece up to this many, with the separator between them.
 template <class Text>
 std::vector<Text> combine(std::vector<Text> const& pieces, int most, Text const& separator) {
     std::vector<Text> texts = pieces;
@@ -155,8 +155,8 @@ std::string naively(std::string const& directory, std::string const& text) {
     return plainly(resolved + joined.substr(end));
 }
 
-/// Wide text as an argument of a program, so that NULs and units that are no characters get
-/// through.
+/// Wide text as an argument of a program, so that NULs and units that are not characters
+/// get through.
 std::string hexadecimal(std::wstring const& text) {
     std::ostringstream units;
     for (wchar_t const c : text) units << std::hex << static_cast<std::uint32_t>(c) << ' ';
@@ -273,7 +273,7 @@ struct App {
         }
     }
 
-    /// The same for texts that are no UTF-8.
+    /// The same for texts that are not UTF-8.
     void check(std::wstring const& text, std::string const& expected) const {
         CHECK(ask(program, dir / "elsewhere", {hexadecimal(text)}) == Strings{expected});
     }
@@ -298,7 +298,7 @@ struct Renamed : Path {
     std::wstring other = L"other";
 };
 
-/// Lets each allocation of the assignment fail in turn and tells how many there are.
+/// Makes each allocation of the assignment fail in turn and tells how many there are.
 template <class Source>
 long checkAssignment(Source const& source, Path const& expected) {
     for (long before = 0;; ++before) {

@@ -42,8 +42,7 @@ struct Peer : test::HasPlace, QSettings {
     }
 };
 
-/// Sets all that a QSettings has in a settings file. Values that are no text have to be turned into
-/// one before.
+/// Sets all that a QSettings has in a settings file. Turn values that are not text into text first.
 void convert(QSettings const& from, InitializationFile& to) {
     for (QString const& name : from.allKeys()) {
         int const slash = name.indexOf('/');

@@ -33,7 +33,7 @@ namespace {
 using Koru::File;
 using Koru::System;
 
-/// Calls a function with the stack so many bytes off an address that sixteen divides.
+/// Calls a function with the stack this many bytes off an address that sixteen divides.
 __attribute__((noinline)) void callOff(unsigned bytes, void (*function)(void*), void* argument) {
     asm volatile("movl %%esp, %%esi\n\t"
                  "andl $-16, %%esp\n\t"

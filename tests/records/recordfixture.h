@@ -206,7 +206,7 @@ inline std::string shown(Entries const& entries) {
     return result;
 }
 
-/// Both are the same in the same order, shown when not.
+/// Checks that both are the same in the same order, and shows them if not.
 inline void checkSame(Entries const& actual, Entries const& expected) {
     bool const same = actual == expected;
     INFO("actual:\n", shown(actual), "expected:\n", shown(expected));

@@ -1,6 +1,6 @@
 // Settings files of other programs: those of this machine, and those of the packages that
-// script/check-realfiles unpacks. What the library lists and writes of each is held against the
-// plain model, on a copy. How many there are differs, and there may be none.
+// script/check-realfiles unpacks. The tests compare what the library lists and writes of each with
+// the plain model, on a copy. How many files there are differs, and there may be none.
 #include <doctest/doctest.h>
 
 #include <array>
@@ -153,7 +153,7 @@ void checkAs(Place const& place, std::string const& bytes) {
     checkSame(Family::list(file), withFirstValues(Family::list(Family::parse(rewritten))));
 }
 
-/// A walk through folders that holds each file against the model, as far as the bounds go.
+/// A walk through folders that compares each file with the model, as far as the bounds go.
 class Walk {
 public:
     /// Follows no link, so that nothing is seen twice.

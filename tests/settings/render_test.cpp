@@ -50,7 +50,7 @@ std::string bytesOfTwoSections(int entries) {
     return bytes;
 }
 
-/// The lines that are no headers, in order.
+/// The lines that are not headers, in order.
 std::vector<std::string> entryLines(std::string const& bytes) {
     std::vector<std::string> lines;
     for (std::size_t at = 0; at < bytes.size();) {

@@ -63,7 +63,7 @@ Sample theme() {
 std::vector<Sample> const samples{
     stored("commons.conf", 20, 4),      // indented, comments with both signs, a section twice
     stored("creatures.quirks", 26, 5),  // sections and keys twice, spelled otherwise
-    stored("dachboden.cfg", 13, 3),     // bytes that are no UTF-8, no end of the last line
+    stored("dachboden.cfg", 13, 3),     // bytes that are not UTF-8, no end of the last line
     stored("dusk.colors", 35, 15),      // small sections, colons in their names
     stored("gatekeeper.conf", 22, 5),   // mostly comments, values that go on below
     stored("harbour.skin", 20, 4),      // indented, with box characters

@@ -21,7 +21,7 @@ struct MallocPlan {
 
 inline thread_local MallocPlan mallocPlan;
 
-/// Lets an allocation of this thread fail within a scope, after some that are given.
+/// Makes an allocation of this thread fail within a scope, after some that succeed.
 class FailingMalloc {
 public:
     FailingMalloc(long before, bool forever) {

@@ -52,7 +52,7 @@ struct MemoryState {
 };
 inline MemoryState memoryState;
 
-/// Lets allocations fail within a scope. Scopes do not nest.
+/// Makes allocations fail within a scope. Scopes do not nest.
 class FailingMemory {
 public:
     explicit FailingMemory(MemoryPlan const& plan) {
@@ -102,8 +102,8 @@ public:
     ~ReserveForHugeBlock() { memoryState.reserve = nullptr; }
 };
 
-/// Lets allocations fail while the callable runs, and says how that ended: "done", "std::bad_alloc"
-/// or another exception's message.
+/// Makes allocations fail while the callable runs, and says how that ended: "done",
+/// "std::bad_alloc" or another exception's message.
 template <class Callable>
 std::string runOutOfMemory(MemoryPlan const& plan, Callable callable) {
     std::string outcome = "done"; // short enough to need no memory

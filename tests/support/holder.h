@@ -9,7 +9,7 @@
 
 namespace test {
 
-/// Holds the lock, taken so many times, until it is told to let go or destroyed.
+/// Holds the lock, taken a number of times, until it is told to let go or destroyed.
 template <class Lock>
 class Holder {
 public:

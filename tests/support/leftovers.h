@@ -44,7 +44,7 @@ class Possessions {
 public:
     /// Compared with an earlier moment: what is more now, or nothing. Threads that have just been
     /// joined or detached, and what they still have open, get time to go.
-    /// @param allowed  so many bytes may be more
+    /// @param allowed  how many bytes more there may be
     std::string moreThan(Possessions const& before, std::size_t allowed) const {
         if (bytes_ > before.bytes_ && bytes_ - before.bytes_ > allowed)
             return std::to_string(bytes_ - before.bytes_) + " bytes";

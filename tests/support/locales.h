@@ -110,7 +110,7 @@ inline std::vector<NamedLocale> const& allLocales() {
     static auto const locales = [] {
         auto all = std::make_unique<Locales>(); // compiling one takes a second
         all->addInstalled();
-        // Turkish pairs i and I otherwise, and in the Latin ones bytes above 0x7F have case.
+        // Turkish pairs i and I differently, and in the Latin ones bytes above 0x7F have case.
         all->compile("tr_TR.UTF-8", "tr_TR", "UTF-8");
         all->compile("tr_TR.ISO-8859-9", "tr_TR", "ISO-8859-9");
         all->compile("de_DE.ISO-8859-1", "de_DE", "ISO-8859-1");

@@ -3,7 +3,7 @@
 // answered here instead of running the tests.
 //
 // A test case that leaves a descriptor open or a thread running makes the program fail. With
-// `--twice` all tests run a second time, and then neither may they leave memory: the first time,
+// `--twice` all tests run a second time, and then they may not leave memory either: the first time,
 // the C library and the tests make what they keep for good, such as locales and time zones.
 #define DOCTEST_CONFIG_IMPLEMENT
 #include <doctest/doctest.h>
@@ -72,8 +72,7 @@ private:
 };
 REGISTER_LISTENER("leftovers", 1, Listener);
 
-/// The exit code of a run that something was left out of: CTest has one for it, see
-/// tests/CMakeLists.txt.
+/// The exit code of a run that left something out: CTest has one for it, see tests/CMakeLists.txt.
 int codeOfSkipped() {
     char const* const code = std::getenv("KORU_TEST_SKIPPED");
     return code == nullptr ? 0 : std::atoi(code);

@@ -8,7 +8,8 @@
 
 namespace test {
 
-/// A file object in a place of its own. With a mode it is open, with bytes they are in the file.
+/// A file object in a place of its own. Given a mode, it is open; given bytes, they are in
+/// the file.
 template <class File>
 class OwnFile : public HasPlace, public File {
 public:

@@ -22,8 +22,8 @@ inline void answer(std::string const& text) {
     std::fwrite(text.c_str(), 1, text.size() + 1, stdout);
 }
 
-/// Starts an executable of the tests in a directory with an argv[0] of one's own, has it run a
-/// registered command (support/selfexec.h) and gives the texts of its answer.
+/// Starts an executable of the tests in a directory with a chosen argv[0], has it run a registered
+/// command (support/selfexec.h) and returns the texts of its answer.
 inline std::vector<std::string> ask(std::string const& program, std::string const& argv0,
                                     std::string const& directory, std::string const& command,
                                     std::vector<std::string> const& arguments) {

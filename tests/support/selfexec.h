@@ -9,7 +9,7 @@
 
 namespace test {
 
-/// A command gets the arguments after its switch and gives the exit code of the process.
+/// A command gets the arguments after its switch and returns the exit code of the process.
 using SelfCommand = std::function<int(int, char**)>;
 
 inline std::map<std::string, SelfCommand>& selfCommands() {

@@ -21,7 +21,7 @@ unsigned long const READ = Koru::File::READ;
 unsigned long const WRITE = Koru::File::WRITE;
 unsigned long const READ_WRITE = Koru::File::READ | Koru::File::WRITE;
 
-/// A settings file of its own. With bytes it is there and open, without it is not.
+/// A settings file of its own. Given bytes, it exists and is open; otherwise neither.
 class SettingsFile : public HasPlace, public Koru::InitializationFile {
 public:
     SettingsFile() : InitializationFile(place.path()) {}
@@ -62,14 +62,14 @@ inline std::string written(Settings const& settings) {
     return file.place.bytes();
 }
 
-/// What a file of these bytes holds when it was opened and closed.
+/// What a file of these bytes holds after it was opened and closed.
 inline std::string rewritten(std::string const& bytes) {
     SettingsFile file(bytes, READ_WRITE);
     file.close();
     return file.place.bytes();
 }
 
-/// Both are the same, shown when not.
+/// Checks that both are the same, and shows them if not.
 template <class T>
 void checkSame(T const& actual, T const& expected) {
     bool const same = actual == expected;

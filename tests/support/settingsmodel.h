@@ -40,7 +40,7 @@ inline std::string shown(Settings const& settings) {
     return result;
 }
 
-/// Names are the same when they differ in case only.
+/// Whether two names differ in case at most.
 inline bool sameName(std::wstring const& a, std::wstring const& b) {
     return Koru::compare(a, b) == 0;
 }

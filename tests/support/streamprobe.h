@@ -175,7 +175,7 @@ inline StreamSetup randomSetup(Random& random) {
     return setup;
 }
 
-/// Holds a way of inserting against another one that does the same, on streams of all kinds.
+/// Compares a way of inserting with another one that does the same, on streams of all kinds.
 template <class Insert, class Expected>
 void expectSameInsertions(Differences& differences, StreamSetup const& setup, Insert insert,
                           Expected expected) {

@@ -1,5 +1,5 @@
-// The three structured files with one face, for what they have in common: opened, loaded, changed
-// and written back whole. Entries are numbers here: entry n has the key "key n".
+// The three structured files behind one interface, for what they have in common: opened, loaded,
+// changed and written back whole. Entries are numbers here: entry n has the key "key n".
 #ifndef KORU_TESTS_STRUCTUREDFILE_H
 #define KORU_TESTS_STRUCTUREDFILE_H
 
@@ -51,7 +51,7 @@ struct SettingsFamily {
         for (int i = first; i < end; ++i) result += narrowKey(i) + "=" + value + "\n";
         return result;
     }
-    /// A file of entry 0 that is not what is written for it.
+    /// A file with entry 0, but not as the library writes it.
     static std::string untidyBytes() { return "; comment\n\n" + bytes(0, 1); }
 
     static void set(File& file, int number, std::string const& value = "value") {

@@ -89,8 +89,8 @@ std::string toldByChild(Callable callable) {
     return outcome.out;
 }
 
-/// How a child ends that runs the callable: "exit 0", say, or "signal 14", which is that of its
-/// alarm: it ends a child that hangs.
+/// How a child that runs the callable ends: "exit 0", say, or "signal 14", when its alarm ends a
+/// child that hangs.
 template <class Callable>
 std::string ending(Callable callable) {
     Outcome const outcome = inChild([&] {

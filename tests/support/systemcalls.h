@@ -47,7 +47,7 @@ constexpr std::array<Call, 13> CALLS = {
 
 /// What the calls of one kind do besides their work.
 struct CallPlan {
-    std::atomic<long> before{-1}; ///< so many succeed before one fails; -1: none fails
+    std::atomic<long> before{-1}; ///< how many succeed before one fails; -1: none fails
     std::atomic<int> error{0};
     std::atomic<bool> forever{false}; ///< whether all later ones fail too
     std::atomic<long> made{0};
@@ -66,11 +66,11 @@ inline std::atomic<int> claimedSize{-1};
 // A sanitizer has a malloc of its own, in whose place no other can be put.
 constexpr bool MALLOC_CAN_FAIL = !SANITIZED;
 
-/// For how many of the streams that this thread opens next the C library gets no memory.
+/// The C library gets no memory for this many of the streams that this thread opens next.
 inline thread_local int streamsWithoutMemory = 0;
 inline thread_local bool opensStream = false;
 
-/// Lets one kind of calls fail within a scope, after some that succeed.
+/// Makes one kind of call fail within a scope, after some that succeed.
 class FailingCall {
 public:
     enum Times { ONCE, FOR_EVER };
@@ -142,7 +142,7 @@ Function realFunction(char const* name) {
     return reinterpret_cast<Function>(::dlsym(RTLD_NEXT, name));
 }
 
-/// The opening of a stream; a file that is to be read on.
+/// Opens a stream by fopen or fopen64, whichever is named.
 inline FILE* openStream(char const* function, char const* name, char const* mode) {
     passCancellationPoint();
     if (failsNow(Call::OPEN)) return nullptr;

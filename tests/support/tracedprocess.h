@@ -34,7 +34,7 @@ inline bool killAtCall(pid_t child, long wanted) {
 }
 
 /// Runs the callable in a child and kills that at system call number `wanted` of the callable.
-/// Returns false if it makes no so many; then all of it has been done.
+/// Returns false if it makes fewer calls; then it has done all of its work.
 template <class Callable>
 bool killedAtCall(long wanted, Callable callable) {
     pid_t const child = ::fork();

@@ -1,4 +1,4 @@
-// The comparison without regard to case, held against the C library's and against the plain rule.
+// The comparison without regard to case, compared with the C library's and with the plain rule.
 #include <koru/string.h>
 
 #include <doctest/doctest.h>
@@ -53,7 +53,7 @@ int order(std::basic_string<Char> const& a, std::basic_string<Char> const& b) {
     return sign(Koru::compare(a.c_str(), b.c_str())) == result ? result : 99;
 }
 
-/// Holds both ways round against the C library's.
+/// Compares both ways round with the C library's.
 template <class Char>
 void expectOrder(Differences& differences, std::basic_string<Char> const& a,
                  std::basic_string<Char> const& b) {
@@ -108,7 +108,7 @@ std::basic_string<Char> widened(std::string const& text) {
     return std::basic_string<Char>(text.begin(), text.end());
 }
 
-/// The order as the plain rule has it.
+/// The order by the plain rule.
 int plainOrder(std::wstring const& a, std::wstring const& b) {
     for (std::size_t i = 0;; ++i) {
         auto const x = towlower(static_cast<wint_t>(a.c_str()[i]));
@@ -118,7 +118,7 @@ int plainOrder(std::wstring const& a, std::wstring const& b) {
     }
 }
 
-/// Holds the order both ways round against the plain one, whatever the locale says of I.
+/// Compares the order both ways round with the plain one, whatever the locale says of I.
 void expectPlainOrder(Differences& differences, std::wstring const& a, std::wstring const& b) {
     for (bool const turkish : {false, true}) {
         pairsDotlessI = turkish;

@@ -1,6 +1,6 @@
-// The two conversions, held against the model. They go through text in blocks and take shortcuts in
-// steps of sixteen units, with the machine's shuffle instruction and without it: their sources are
-// compiled into this program, so that it reaches both ways whatever the machine has.
+// The two conversions, compared with the model. They go through text in blocks and take shortcuts
+// in steps of sixteen units, with the machine's shuffle instruction and without it: their sources
+// are compiled into this program, so that it reaches both ways whatever the machine has.
 #include <koru/string.h>
 
 #include <doctest/doctest.h>
@@ -82,7 +82,7 @@ std::basic_string<Out> byBlocks(std::basic_string<In> const& text, bool shuffle)
     return result;
 }
 
-/// Holds all ways of converting a text against the model.
+/// Compares all ways of converting a text with the model.
 template <class Text>
 void expectConverted(Differences& differences, Text const& text) {
     auto const expected = modelOf(text);

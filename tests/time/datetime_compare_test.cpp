@@ -1,5 +1,5 @@
 // DateTime to seconds and compared. Values compare by their seconds, and the library decides that
-// without converting them where it can: so many pairs are held against the seconds.
+// without converting them where it can: so these tests compare many pairs with their seconds.
 #include "time/datetimefixture.h"
 
 #include <doctest/doctest.h>

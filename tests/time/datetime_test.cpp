@@ -1,5 +1,5 @@
 // DateTime: its shape, fields and setters, and the conversions from broken-down time, seconds and
-// timeval, held against a model that calls the C library as the conversion is described.
+// timeval, compared with a model that calls the C library as the conversion is described.
 #include "time/datetimefixture.h"
 
 #include <doctest/doctest.h>

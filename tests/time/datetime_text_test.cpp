@@ -1,4 +1,4 @@
-// DateTime from text, to text and to streams. Reading is held against a model of a few lines.
+// DateTime from text, to text and to streams. Reading is compared with a model of a few lines.
 #include "time/datetimefixture.h"
 
 #include <doctest/doctest.h>

@@ -28,7 +28,7 @@ unsigned int const DATE = DateTime::DATE;
 unsigned int const TIME = DateTime::TIME;
 unsigned int const BOTH = DateTime::DATE | DateTime::TIME;
 
-/// What the time functions of the C library are asked within a scope, and what they shall answer.
+/// What the time functions of the C library are asked within a scope, and what they are to answer.
 struct Calls {
     Calls() { active = this; }
     Calls(Calls const&) = delete;
@@ -191,7 +191,7 @@ inline bool isSame(std::tm const& a, std::tm const& b) {
            a.tm_isdst == b.tm_isdst;
 }
 
-/// Parts with and without bits that are none.
+/// Parts with and without bits that mean nothing.
 unsigned int const ANY_PARTS[] = {0,     DATE,  TIME,       BOTH,       4,         7,
                                   0x100, 0x101, 0xFFFFFF02, 0xFFFFFFFE, 0xFFFFFFFF};
 

@@ -185,7 +185,7 @@ TEST_CASE("what has no form in a format is refused there") {
           "2 koru: r: a key with = would be cut there\n");
     CHECK(desk.output({"records", "export", "r", "--format=json"}) ==
           "{\"key\":\"a=b\",\"data\":\"01\"}\n");
-    // A surrogate comes back, but is no character of Unicode.
+    // A surrogate comes back, but is not a character of Unicode.
     desk.write("p", "k=\xED\xA0\x80\n");
     CHECK(desk.output({"properties", "export", "p"}) == "k=\xED\xA0\x80\n");
     CHECK(desk.complaint({"properties", "export", "p", "--format=json"}) ==

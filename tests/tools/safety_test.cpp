@@ -1,4 +1,4 @@
-// What `koru` does to files besides: nothing where it reads, and where it writes no file is lost.
+// What else `koru` does to files: nothing where it reads, and where it writes it loses no file.
 #include <doctest/doctest.h>
 
 #include <signal.h>
