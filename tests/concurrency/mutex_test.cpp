@@ -320,7 +320,7 @@ TEST_CASE("an assigned mutex takes over the other's state and returns itself") {
     follow(target, "held unlock free");
 }
 
-TEST_CASE("a held mutex to which a free one is assigned is free, and recursive still") {
+TEST_CASE("a held mutex to which a free one is assigned is free, and still recursive") {
     Mutex const free;
     Mutex target;
     follow(target, "lock");
@@ -361,7 +361,7 @@ TEST_CASE("a thread that is cancelled while it polls is unwound and holds nothin
           }) == "exit 0");
 }
 
-TEST_CASE("a mutex that is free is locked, asked and unlocked without being a cancellation point") {
+TEST_CASE("locking, asking and unlocking a free mutex are not cancellation points") {
     CHECK(test::ending([] {
               Mutex mutex;
               std::atomic<bool> came{false};

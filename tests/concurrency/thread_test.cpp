@@ -779,7 +779,7 @@ TEST_CASE("a lock that an aborted thread waited for is free when its holder lets
           }) == "exit 0");
 }
 
-TEST_CASE_FIXTURE(Pipe, "an aborted thread is unwound out of opening a file that lets it wait") {
+TEST_CASE_FIXTURE(Pipe, "an aborted thread is unwound out of opening a file that makes it wait") {
     for (unsigned long const mode : {Koru::File::READ + 0, Koru::File::WRITE + 0}) {
         CAPTURE(mode);
         checkAborted([&](std::atomic<bool>& begun) {
@@ -790,7 +790,7 @@ TEST_CASE_FIXTURE(Pipe, "an aborted thread is unwound out of opening a file that
     }
 }
 
-TEST_CASE_FIXTURE(Pipe, "an aborted thread is unwound out of reading and writing a pipe that lets "
+TEST_CASE_FIXTURE(Pipe, "an aborted thread is unwound out of reading and writing a pipe that makes "
                         "it wait") {
     // Both ends are held open here, so opening does not wait; nobody reads or writes.
     int const end = ::open((directory / "pipe").c_str(), O_RDWR | O_CLOEXEC);

@@ -443,8 +443,8 @@ TEST_CASE_TEMPLATE("a last line that the end of the file cuts off is lost where 
     CHECK(test::sizeOf<Family>(file) == 2);
 }
 
-TEST_CASE_TEMPLATE("a file that cannot be gone back in is no empty file", Family, Sectioned, Flat,
-                   Records) {
+TEST_CASE_TEMPLATE("a file that cannot be read from its start again is not an empty file", Family,
+                   Sectioned, Flat, Records) {
     Stored<Family> const stored;
     for (int const error : {EIO, EINVAL, EOVERFLOW}) {
         CAPTURE(error);

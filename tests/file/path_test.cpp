@@ -442,7 +442,7 @@ TEST_CASE("an overlong slash splits a narrow path, as it is decoded before") {
     CHECK(parsed("\xC0\x80/a/b") == EMPTY);
 }
 
-TEST_CASE("an absolute path keeps units that are no characters") {
+TEST_CASE("an absolute path keeps units that are not characters") {
     std::wstring const name = {static_cast<wchar_t>(0x80000041U), static_cast<wchar_t>(0x8000002FU),
                                static_cast<wchar_t>(0xD800), static_cast<wchar_t>(0x7FFFFFFF)};
     CHECK(Path(L"/a/" + name).getDirectory() == L"/a/");

@@ -265,8 +265,8 @@ TEST_CASE_FIXTURE(Folder, "remove of what is missing is true") {
     }
 }
 
-TEST_CASE_FIXTURE(Folder, "remove of a directory that is not empty is false and leaves it its "
-                          "owner's alone") {
+TEST_CASE_FIXTURE(Folder, "remove of a directory that is not empty is false and leaves it with "
+                          "mode 0600") {
     write("d/file", "content");
     permit("d", 0755);
     permit("d/file", 0640);

@@ -213,7 +213,7 @@ TEST_CASE("an entry before the first header is ignored") {
     CHECK(settings.enumerateSections().empty());
 }
 
-TEST_CASE("a line that is no entry is ignored") {
+TEST_CASE("a line that is not an entry is ignored") {
     char const* const content = "[Window]\nwidth\nheight=600\n";
     Peer file(content);
     SettingsFile settings(content);
@@ -230,7 +230,7 @@ TEST_CASE("a carriage return stays") {
     CHECK(text(settings.getValue(L"s]\r", L"k")) == "1\r");
 }
 
-TEST_CASE("text that is no UTF-8 is not refused") {
+TEST_CASE("text that is not UTF-8 is not refused") {
     char const* const content = "[s]\nk=\xE9\n";
     Peer file(content);
     SettingsFile settings(content);

@@ -185,7 +185,7 @@ TEST_CASE("a line may be of any length") {
     CHECK(settings.getValue(L"s", L"k").size() == 300);
 }
 
-TEST_CASE("a line that is no entry is ignored") {
+TEST_CASE("a line that is not an entry is ignored") {
     char const* const content = "[Window]\nwidth\nheight=600\n";
     Peer const reader(content);
     SettingsFile settings(content);

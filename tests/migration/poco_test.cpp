@@ -338,7 +338,7 @@ TEST_CASE("an identifier is not made") {
     CHECK(static_cast<std::string>(Koru::Uuid(peer.toString())) == peer.toString());
 }
 
-TEST_CASE("text that is no identifier is zero") {
+TEST_CASE("text that is not an identifier is zero") {
     CHECK_THROWS_AS(Poco::UUID("no identifier"), Poco::SyntaxException);
     CHECK(Koru::Uuid("no identifier") == Koru::Uuid());
 }

@@ -185,7 +185,7 @@ TEST_CASE("an entry before the first header is ignored") {
     CHECK(settings.getValue(L"", L"width").empty());
 }
 
-TEST_CASE("a line that is no entry is ignored") {
+TEST_CASE("a line that is not an entry is ignored") {
     char const* const content = "[Window]\nwidth\nheight=600\n";
     Peer ini(content);
     SettingsFile settings(content);

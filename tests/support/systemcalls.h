@@ -63,7 +63,7 @@ inline thread_local long callsBeforeCancellation = -1;
 /// What the system says is to come when it is asked; -1: the truth.
 inline std::atomic<int> claimedSize{-1};
 
-// A sanitizer has a malloc of its own, in whose place no other can be put.
+// A sanitizer has a malloc of its own, which no other can replace.
 constexpr bool MALLOC_CAN_FAIL = !SANITIZED;
 
 /// The C library gets no memory for this many of the streams that this thread opens next.

@@ -276,7 +276,7 @@ TEST_CASE("a failed load leaves nothing loaded and may be repeated until the fil
     CHECK(library.unload());
 }
 
-TEST_CASE("what is no library is not loaded") {
+TEST_CASE("what is not a library is not loaded") {
     test::TempDir const directory;
     test::writeFile(directory / "empty.so", "");
     test::writeFile(directory / "text.so", "some text\n");

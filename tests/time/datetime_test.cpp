@@ -151,7 +151,7 @@ TEST_CASE("a copy has every field and the parts") {
     }
 }
 
-TEST_CASE("of the four conversions every one takes both parts if none are named") {
+TEST_CASE("each of the four conversions takes both parts if none are named") {
     Zone const zone("IST-5:30");
     CHECK(shown(DateTime(brokenDown(2005, 3, 7, 9, 5, 1))) == "2005/3/7 9:5:1.0 offset 5 parts 3");
     CHECK(shown(DateTime(MARCH)) == "2005/3/7 14:35:0.0 offset 5 parts 3");
