@@ -239,6 +239,20 @@ TEST_CASE_TEMPLATE("close that cannot create the new file through a stream write
     ::umask(mask);
 }
 
+TEST_CASE_TEMPLATE("close writes the new file through any descriptor, standard input's too", Family,
+                   Sectioned, Flat, Records) {
+    Stored<Family> const stored;
+    stored.restore();
+    CHECK(test::ending([&] {
+              auto const file = stored.changed();
+              ::close(STDIN_FILENO);
+              FailingCall const fault(Call::OPEN, EMFILE);
+              bool const isReported = complaint([&] { file->close(); }) == NOT_OPENED;
+              return isReported && ::fcntl(STDIN_FILENO, F_GETFD) == -1 ? 0 : 1;
+          }) == "exit 0");
+    CHECK(stored.isNew());
+}
+
 TEST_CASE_TEMPLATE("a file whose buffer stays open stays as it was, and can be closed later",
                    Family, Sectioned, Flat, Records) {
     Stored<Family> const stored;

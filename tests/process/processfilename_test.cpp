@@ -11,8 +11,10 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cstddef>
+#include <cstdint>
 #include <cstring>
 #include <filesystem>
 #include <iterator>
@@ -32,11 +34,14 @@
 #include "support/tempdir.h"
 
 // Reading and closing, of this executable and the libraries it loaded, pass through here, so that a
-// test can have a thread cancelled in either.
+// test can have a thread cancelled in either, or read in pieces and to an early end.
 namespace {
 
 enum class CancelledIn { NOTHING, READ, CLOSE };
 thread_local CancelledIn cancelledIn = CancelledIn::NOTHING;
+
+thread_local std::size_t bytesAtATime = SIZE_MAX;
+thread_local std::size_t bytesLeft = SIZE_MAX;
 
 void _cancelIn(CancelledIn call) {
     if (cancelledIn != call) return;
@@ -49,7 +54,10 @@ void _cancelIn(CancelledIn call) {
 
 extern "C" ssize_t read(int fd, void* buffer, size_t count) {
     _cancelIn(CancelledIn::READ);
-    return static_cast<ssize_t>(::syscall(SYS_read, fd, buffer, count));
+    auto const arrived = static_cast<ssize_t>(
+        ::syscall(SYS_read, fd, buffer, std::min({count, bytesAtATime, bytesLeft})));
+    if (arrived > 0 && bytesLeft != SIZE_MAX) bytesLeft -= static_cast<std::size_t>(arrived);
+    return arrived;
 }
 
 extern "C" int close(int fd) {
@@ -170,6 +178,28 @@ TEST_CASE("getProcessFileName is a static function of no arguments that gives a 
 TEST_CASE("the running test's own name is its first argument, resolved") {
     std::string const commandLine = test::readFile("/proc/self/cmdline");
     CHECK(processFileName() == resolved(commandLine.c_str()));
+}
+
+TEST_CASE("a command line that arrives in pieces is the same") {
+    std::string const whole = processFileName();
+    for (std::size_t const size : {1U, 2U, 3U, 7U}) {
+        CAPTURE(size);
+        bytesAtATime = size;
+        std::string const name = processFileName();
+        bytesAtATime = SIZE_MAX;
+        CHECK(name == whole);
+    }
+}
+
+TEST_CASE("a command line that ends without a zero byte is read to its end") {
+    std::string const commandLine = test::readFile("/proc/self/cmdline");
+    for (std::size_t const size : {0U, 1U, 5U}) {
+        CAPTURE(size);
+        bytesLeft = size;
+        std::string const name = processFileName();
+        bytesLeft = SIZE_MAX;
+        CHECK(name == resolved(commandLine.substr(0, size)));
+    }
 }
 
 TEST_CASE("the name is to be had from a static constructor of the program") {
