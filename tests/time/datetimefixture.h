@@ -6,7 +6,6 @@
 #include <koru/datetime.h>
 
 #include <dlfcn.h>
-#include <stdlib.h>
 
 #include <cstddef>
 #include <cstdint>
@@ -20,6 +19,7 @@
 
 #include "support/differences.h"
 #include "support/throws.h"
+#include "support/zone.h"
 
 namespace test {
 
@@ -87,25 +87,6 @@ extern "C" std::tm* localtime(std::time_t const* moment) noexcept {
 }
 
 namespace test {
-
-/// The process's time zone, as a POSIX text, for as long as it lives.
-class Zone {
-public:
-    explicit Zone(char const* text) {
-        if (char const* const before = ::getenv("TZ")) before_ = before;
-        ::setenv("TZ", text, 1);
-        ::tzset();
-    }
-    Zone(Zone const&) = delete;
-    Zone& operator=(Zone const&) = delete;
-    ~Zone() {
-        ::setenv("TZ", before_.c_str(), 1);
-        ::tzset();
-    }
-
-private:
-    std::string before_ = "UTC0";
-};
 
 char const CENTRAL_EUROPE[] = "CET-1CEST,M3.5.0,M10.5.0/3";
 char const NEW_YORK[] = "EST5EDT,M3.2.0,M11.1.0";

@@ -31,6 +31,7 @@
 #include "support/skip.h"
 #include "support/tempdir.h"
 #include "support/throws.h"
+#include "support/zone.h"
 
 using Koru::DateTime;
 using Koru::File;
@@ -72,24 +73,6 @@ std::string text(Timer const& timer) {
     out << timer;
     return out.str();
 }
-
-/// TZ for the time of a scope.
-class Zone {
-public:
-    explicit Zone(char const* text) {
-        if (char const* const before = ::getenv("TZ")) before_ = before;
-        ::setenv("TZ", text, 1);
-    }
-    Zone(Zone const&) = delete;
-    Zone& operator=(Zone const&) = delete;
-    ~Zone() {
-        ::setenv("TZ", before_.c_str(), 1);
-        ::tzset();
-    }
-
-private:
-    std::string before_ = "UTC0";
-};
 
 /// Says of a file that it was changed in 2040. False if the system cannot.
 bool isDated2040(std::string const& path) {
@@ -182,7 +165,7 @@ TEST_CASE("dates after 2038 are read, held and written as any other") {
 }
 
 TEST_CASE("a date after 2038 has no seconds on 32 bits") {
-    Zone const zone("UTC0");
+    test::Zone const zone("UTC0");
     CHECK(static_cast<long>(DateTime("2038-01-19 03:14:07")) == 2147483647L);
     std::int64_t const next = static_cast<long>(DateTime("2038-01-19 03:14:08"));
     CHECK(next == (IS_32_BIT ? -1 : LAST_OF_32_BITS + 1));
@@ -191,7 +174,7 @@ TEST_CASE("a date after 2038 has no seconds on 32 bits") {
 }
 
 TEST_CASE("where the zone is ahead of UTC local dates end later than UTC's") {
-    Zone const zone("CET-1");
+    test::Zone const zone("CET-1");
     CHECK(static_cast<long>(DateTime("2038-01-19 04:14:07")) == 2147483647L);
     std::int64_t const next = static_cast<long>(DateTime("2038-01-19 04:14:08"));
     CHECK(next == (IS_32_BIT ? -1 : LAST_OF_32_BITS + 1));

@@ -11,39 +11,23 @@
 #include <koru/datetime.h>
 
 #include "support/skip.h"
+#include "support/zone.h"
 
 using Koru::DateTime;
+using test::Zone;
 
 namespace {
 
 char const CENTRAL_EUROPE[] = "CET-1CEST,M3.5.0,M10.5.0/3";
-
-/// TZ for the time of a scope. The C library is not told; it looks by itself.
-class Zone {
-public:
-    explicit Zone(char const* text) {
-        if (char const* const before = ::getenv("TZ")) before_ = before;
-        ::setenv("TZ", text, 1);
-    }
-    Zone(Zone const&) = delete;
-    Zone& operator=(Zone const&) = delete;
-    ~Zone() {
-        ::setenv("TZ", before_.c_str(), 1);
-        ::tzset();
-    }
-
-private:
-    std::string before_ = "UTC0";
-};
 
 long seconds(char const* text) { return DateTime(text); }
 std::string text(long seconds) { return DateTime(seconds); }
 
 /// How many hours local time is ahead of UTC at that time of a zone.
 long hoursAhead(char const* zone, char const* at) {
-    Zone const utc("UTC0");
+    Zone const utc("UTC0", Zone::UNTOLD);
     long const there = seconds(at);
-    Zone const scope(zone);
+    Zone const scope(zone, Zone::UNTOLD);
     return (there - seconds(at)) / 3600;
 }
 
@@ -51,7 +35,7 @@ long hoursAhead(char const* zone, char const* at) {
 
 TEST_CASE("a zone that is set while the program runs counts from the next conversion") {
     DateTime const noon("2005-07-07 12:00:00");
-    Zone const first(CENTRAL_EUROPE);
+    Zone const first(CENTRAL_EUROPE, Zone::UNTOLD);
     CHECK(static_cast<long>(noon) == 1120730400);
     CHECK(text(1120730400) == "2005-07-07 12:00:00");
     ::setenv("TZ", "EST5EDT,M3.2.0,M11.1.0", 1);
@@ -62,9 +46,9 @@ TEST_CASE("a zone that is set while the program runs counts from the next conver
 TEST_CASE("a comparison of dates that are far apart does not look at a changed zone") {
     DateTime const early("2005-07-07 12:00:00");
     DateTime const late("2005-07-14 12:00:00");
-    Zone const before("UTC0");
+    Zone const before("UTC0", Zone::UNTOLD);
     CHECK(seconds("2005-07-07 12:00:00") == 1120737600);
-    Zone const zone(CENTRAL_EUROPE);
+    Zone const zone(CENTRAL_EUROPE, Zone::UNTOLD);
     CHECK(early < late);
     CHECK(std::string(::tzname[0]) == "UTC");
     CHECK(static_cast<long>(early) == 1120730400);
@@ -87,7 +71,7 @@ TEST_CASE("a zone of a name has the rules of each year") {
 }
 
 TEST_CASE("of the hour that comes twice glibc takes the one that fits the conversion before") {
-    Zone const zone(CENTRAL_EUROPE);
+    Zone const zone(CENTRAL_EUROPE, Zone::UNTOLD);
     CHECK(seconds("2005-12-01 12:00:00") == 1133434800);
     CHECK(seconds("2005-10-30 02:30:00") == 1130635800);
     CHECK(seconds("2005-07-01 12:00:00") == 1120212000);
@@ -95,12 +79,12 @@ TEST_CASE("of the hour that comes twice glibc takes the one that fits the conver
 }
 
 TEST_CASE("the hour that is missing becomes one before or after it") {
-    Zone const zone(CENTRAL_EUROPE);
+    Zone const zone(CENTRAL_EUROPE, Zone::UNTOLD);
     CHECK(text(seconds("2005-03-27 02:30:00")) == "2005-03-27 03:30:00");
 }
 
 TEST_CASE("fields beyond the calendar are carried over") {
-    Zone const zone("UTC0");
+    Zone const zone("UTC0", Zone::UNTOLD);
     CHECK(text(seconds("2005-02-31 10:00:00")) == "2005-03-03 10:00:00");
     CHECK(DateTime("2005-02-31 10:00:00") == DateTime("2005-03-03 10:00:00"));
 }
