@@ -5,7 +5,6 @@
 
 #include <doctest/doctest.h>
 
-#include <signal.h>
 #include <sys/resource.h>
 
 #include <initializer_list>
@@ -17,6 +16,7 @@
 #include <koru/propertyfile.h>
 #include <koru/string.h>
 
+#include "support/filesizelimit.h"
 #include "support/ownfile.h"
 #include "support/settingsfixture.h"
 #include "support/tempdir.h"
@@ -46,21 +46,16 @@ inline std::string text(std::vector<std::wstring> const& list) {
 /// A disk on which files have room for four bytes, for the time of a scope.
 class FullDisk {
 public:
-    FullDisk() : handler_(::signal(SIGXFSZ, SIG_IGN)) {
-        ::getrlimit(RLIMIT_FSIZE, &limit_);
-        rlimit const four = {4, limit_.rlim_max};
-        ::setrlimit(RLIMIT_FSIZE, &four);
+    FullDisk() {
+        ::getrlimit(RLIMIT_FSIZE, &before_);
+        limitFileSize(4);
     }
     FullDisk(FullDisk const&) = delete;
     FullDisk& operator=(FullDisk const&) = delete;
-    ~FullDisk() {
-        ::setrlimit(RLIMIT_FSIZE, &limit_);
-        ::signal(SIGXFSZ, handler_);
-    }
+    ~FullDisk() { limitFileSize(before_.rlim_cur); }
 
 private:
-    void (*handler_)(int);
-    rlimit limit_ = {};
+    rlimit before_ = {};
 };
 
 /// What is left of Koru's file when the disk is full while it is saved, and the object is given up.

@@ -2,8 +2,6 @@
 #include <doctest/doctest.h>
 
 #include <grp.h>
-#include <signal.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -21,6 +19,7 @@
 #include <koru/logfile.h>
 #include <koru/string.h>
 
+#include "support/filesizelimit.h"
 #include "support/ownfile.h"
 #include "support/selfexec.h"
 #include "support/slots.h"
@@ -551,11 +550,7 @@ TEST_CASE("the opening of a log can be overridden") {
 TEST_CASE("a write that fails shows in the state of the stream and throws nothing") {
     Place const place;
     CHECK(toldByChild([&] {
-              ::signal(SIGXFSZ, SIG_IGN);
-              rlimit limit = {};
-              ::getrlimit(RLIMIT_FSIZE, &limit);
-              limit.rlim_cur = 5;
-              ::setrlimit(RLIMIT_FSIZE, &limit);
+              test::limitFileSize(5);
               LogFile log(place.path());
               log.open(READ_WRITE);
               put(log, "more than five bytes");

@@ -3,7 +3,6 @@
 
 #include <grp.h>
 #include <sched.h>
-#include <signal.h>
 #include <stdlib.h>
 #include <sys/mount.h>
 #include <sys/resource.h>
@@ -17,6 +16,7 @@
 #include <string>
 
 #include "structured/fixture.h"
+#include "support/filesizelimit.h"
 #include "support/skip.h"
 #include "support/subprocess.h"
 #include "support/systemcalls.h"
@@ -215,19 +215,6 @@ FAMILIES_TEST_CASE("after a write that failed the next close writes everything")
     CHECK(isPrefix(left, file.bytes()));
 }
 
-namespace {
-
-/// Limits the size of files that this process writes. Only for child processes.
-void limitFileSize(rlim_t bytes) {
-    ::signal(SIGXFSZ, SIG_IGN);
-    rlimit limit = {};
-    ::getrlimit(RLIMIT_FSIZE, &limit);
-    limit.rlim_cur = bytes;
-    ::setrlimit(RLIMIT_FSIZE, &limit);
-}
-
-} // namespace
-
 FAMILIES_TEST_CASE("a file-size limit is a failure to write") {
     for (std::size_t const size : {1UL, 100UL, 200000UL}) {
         for (rlim_t const limit : {0UL, 1UL, 5UL}) {
@@ -237,11 +224,11 @@ FAMILIES_TEST_CASE("a file-size limit is a failure to write") {
             std::string const told = toldByChild([&] {
                 OwnFile<Family> file("", READ_WRITE);
                 file.put(0, std::string(size, 'x'));
-                limitFileSize(limit);
+                test::limitFileSize(limit);
                 std::string text = after(file, READ_WRITE, [&] { file.close(); });
                 text += isPrefix(file.bytes(), complete) ? "prefix; " : "other; ";
                 text += after(file, READ_WRITE, [&] { file.synchronize(); });
-                limitFileSize(RLIM_INFINITY);
+                test::limitFileSize(RLIM_INFINITY);
                 text += after(file, READ_WRITE, [&] { file.synchronize(); });
                 return text + (file.bytes() == complete ? "complete" : "incomplete");
             });
@@ -259,7 +246,7 @@ FAMILIES_TEST_CASE("a destructor that cannot write does not end the process") {
                 CAPTURE(closes);
                 CAPTURE(throws);
                 CHECK(toldByChild([&] {
-                          limitFileSize(2);
+                          test::limitFileSize(2);
                           OwnFile<Family> file("", WRITE);
                           file.put(0, std::string(size, 'x'));
                           std::string const message =

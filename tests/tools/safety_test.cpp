@@ -1,9 +1,7 @@
 // What else `koru` does to files: nothing where it reads, and where it writes it loses no file.
 #include <doctest/doctest.h>
 
-#include <signal.h>
 #include <sys/file.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -11,6 +9,7 @@
 #include <filesystem>
 #include <string>
 
+#include "support/filesizelimit.h"
 #include "support/sanitizers.h"
 #include "support/skip.h"
 #include "support/tracedprocess.h"
@@ -149,9 +148,7 @@ TEST_CASE("a change that cannot be written leaves the old file and nothing else"
     Desk const desk;
     desk.write("f", "[s]\nk=v\n");
     test::Outcome const outcome = test::inChild([&] {
-        struct rlimit const limit = {2000, 2000}; // bytes a file may have
-        ::setrlimit(RLIMIT_FSIZE, &limit);
-        ::signal(SIGXFSZ, SIG_IGN);
+        test::limitFileSize(2000);
         test::redirect("/dev/null", O_WRONLY, STDERR_FILENO);
         return test::become(desk.path(),
                             {"settings", "set", "f", "s", "k", std::string(4000, 'x')});
