@@ -6,6 +6,7 @@
 #include <cctype>
 #include <cstddef>
 #include <cstdint>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -54,10 +55,17 @@ extern "C" int LLVMFuzzerTestOneInput(std::uint8_t const* data, std::size_t size
     std::vector<unsigned char> const bytes = uuid;
     KORU_CHECK(bytes.size() == 16);
     KORU_CHECK(!(Koru::Uuid(bytes) != uuid));
+    std::ostringstream out;
+    out << uuid;
+    KORU_CHECK(out.str() == written);
 
     // The input as the bytes themselves.
     std::vector<unsigned char> const raw(data, data + size);
     std::vector<unsigned char> const kept = Koru::Uuid(raw);
     KORU_CHECK(kept == (size == 16 ? raw : std::vector<unsigned char>(16)));
+    if (size < 16) return 0;
+    unsigned char array[16];
+    std::copy_n(data, 16, array);
+    KORU_CHECK(Koru::Uuid(array) == Koru::Uuid(std::vector<unsigned char>(array, array + 16)));
     return 0;
 }
