@@ -254,12 +254,13 @@ using Body = std::function<void(std::atomic<bool>&)>;
 
 /// Runs the body on a thread that is aborted a while after it has begun, in a process that ends
 /// without destructors: there is no moment at which the last use by the thread is known to be over.
+/// The object is static, or a sanitizer would find it lost at the end.
 /// @return 0 when the thread has been unwound and is gone
 int abortedAfter(unsigned int microseconds, Body const& body) {
     int const threads = threadCount();
     std::atomic<bool> begun{false};
     std::atomic<bool> left{false};
-    Work& work = *new Work([&](void*) -> void* {
+    static Work& work = *new Work([&](void*) -> void* {
         Witness const witness{left};
         body(begun);
         for (;;) ::pause(); // Only unwinding leads out.
