@@ -31,7 +31,7 @@ Text _format(unsigned char const (&bytes)[16]) {
     store16(digits.data(), _toDigits(_mm_unpacklo_epi8(high, low)));
     store16(digits.data() + 16, _toDigits(_mm_unpackhi_epi8(high, low)));
     Text text;
-    text.fill('-');
+    text[8] = text[13] = text[18] = text[23] = '-';
     std::memcpy(&text[0], &digits[0], 8);
     std::memcpy(&text[9], &digits[8], 4);
     std::memcpy(&text[14], &digits[12], 4);

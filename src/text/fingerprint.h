@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "text/fold.h"
+#include "text/processor.h"
 
 namespace Koru {
 
@@ -15,12 +16,9 @@ using Fingerprint = std::uint16_t;
 
 constexpr std::size_t NOT_FOUND = static_cast<std::size_t>(-1);
 
-/// Whether this machine has vectors of 32 bytes.
-inline bool hasWideVectors() { return __builtin_cpu_supports("avx2"); }
-
 /// The position of the first such number in a column, from a position on, or NOT_FOUND.
 std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint wanted,
-                            std::size_t from, bool wideVectors = hasWideVectors());
+                            std::size_t from, bool wideVectors = HAS_WIDE_VECTORS);
 
 /// The same for the first of two numbers.
 std::size_t findFingerprint(std::vector<Fingerprint> const& column, Fingerprint wanted,

@@ -14,6 +14,7 @@
 #include "text/fold.h"
 #include "text/insert.h"
 #include "text/narrow.h"
+#include "text/processor.h"
 #include "text/utf8.h"
 
 namespace Koru {
@@ -140,10 +141,9 @@ _convert(In const* s, In const* end, std::basic_string<Out> const& nothing,
          ConvertBlock convertBlock, Bound bound) try {
     if (s == end) return nothing;
     if (_isPlainName(s, end)) return std::basic_string<Out>(s, end);
-    bool const shuffle = canShuffle();
     alignas(BLOCK_ALIGNMENT) Out block[BLOCK];
     auto const fill = [&] {
-        return static_cast<std::size_t>(convertBlock(s, end, block, shuffle) - block);
+        return static_cast<std::size_t>(convertBlock(s, end, block, CAN_SHUFFLE) - block);
     };
     std::size_t filled = fill();
     if (s == end) return _toString(block, filled);
@@ -184,10 +184,9 @@ std::wstring make_wstring(char const* s, std::size_t size) {
 }
 
 char* encode(wchar_t const* s, std::size_t size, char* to) {
-    bool const shuffle = canShuffle();
     alignas(BLOCK_ALIGNMENT) char block[BLOCK];
     for (wchar_t const* const end = s + size; s != end;) {
-        to = std::copy(block, encodeBlock(s, end, block, shuffle), to);
+        to = std::copy(block, encodeBlock(s, end, block, CAN_SHUFFLE), to);
     }
     return to;
 }

@@ -28,12 +28,10 @@ struct Progress {
     Out* to;
 };
 
-/// Whether this machine can rearrange the bytes of a register at will.
-inline bool canShuffle() { return __builtin_cpu_supports("ssse3"); }
-
 /// Decodes to a block until it may be too small for another step, or the text ends, or a zero comes
 /// out, which ends the text. Moves `s` on, to `end` in the latter cases, and returns the end of
-/// what was written. There is no zero byte before `end`.
+/// what was written. There is no zero byte before `end`. To `shuffle` is only for a machine that
+/// can (see CAN_SHUFFLE).
 wchar_t* decodeBlock(char const*& s, char const* end, wchar_t* to, bool shuffle);
 
 /// The same from characters to bytes, where the text also ends at a character of zero.

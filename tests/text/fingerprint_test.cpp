@@ -176,7 +176,7 @@ TEST_CASE("a number is found first at its first place from any place on, in colu
                     return found == column.end() ? NOT_FOUND
                                                  : static_cast<std::size_t>(found - column.begin());
                 };
-                for (bool const wide : {false, Koru::hasWideVectors()}) {
+                for (bool const wide : {false, Koru::HAS_WIDE_VECTORS}) {
                     CHECK(findFingerprint(column, 2, from, wide) ==
                           expect([](auto n) { return n == 2; }));
                 }
