@@ -13,7 +13,9 @@ fail() {
 runConsumer() { # PROGRAM
     [[ $("$1" "$work/app.ini") == name=K*ru ]] || fail "the program does not read what it wrote"
     grep -q '^\[library\]$' "$work/app.ini" || fail "the program wrote no file"
-    ldd "$1" | grep -qE 'libkoru\.so\.1 => /(usr/)?lib/[^/]*-linux-gnu/' ||
-        fail "the program finds another library: $(ldd "$1")"
+    local found
+    found=$(ldd "$1")
+    grep -qE 'libkoru\.so\.1 => /(usr/)?lib/[^/]*-linux-gnu/' <<<"$found" ||
+        fail "the program finds another library: $found"
     rm "$work/app.ini"
 }
