@@ -122,8 +122,8 @@ int const NOT_ALLOWED = 77;
 /// library says then. Nothing outside of the process changes, and no name server is asked.
 int answerAs(std::string const& name, std::string const& hostsFile) {
     if (::unshare(CLONE_NEWUTS | CLONE_NEWNS) != 0 ||
-        ::mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0 ||
-        ::mount(hostsFile.c_str(), "/etc/hosts", nullptr, MS_BIND, nullptr) != 0 ||
+        ::mount("none", "/", "none", MS_REC | MS_PRIVATE, nullptr) != 0 ||
+        ::mount(hostsFile.c_str(), "/etc/hosts", "none", MS_BIND, nullptr) != 0 ||
         ::sethostname(name.data(), name.size()) != 0)
         return NOT_ALLOWED;
     if (::__nss_configure_lookup("hosts", "files") != 0) return 1;
