@@ -139,10 +139,15 @@ void forEachFailure(Attempt attempt) {
     }
 }
 
-/// Ends the process when a test hangs on a lock that was not given back.
+/// Ends the process when a test hangs on a lock that was not given back: after 200 seconds, or as
+/// many as the environment's KORU_WATCHDOG says, for tools that make a program slow.
 class Watchdog {
 public:
-    Watchdog() { ::alarm(200); }
+    Watchdog() {
+        char const* const seconds = std::getenv("KORU_WATCHDOG");
+        ::alarm(seconds == nullptr ? 200U
+                                   : static_cast<unsigned int>(std::strtoul(seconds, nullptr, 10)));
+    }
     Watchdog(Watchdog const&) = delete;
     Watchdog& operator=(Watchdog const&) = delete;
     ~Watchdog() { ::alarm(0); }
