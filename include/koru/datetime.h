@@ -92,7 +92,9 @@ public:
     void clear(unsigned int parts);
 
     /// The seconds since the epoch for the fields as local time; -1 if `mktime` fails. The C
-    /// library decides on daylight saving. A year of 0 counts as 1900, a month of 0 as January.
+    /// library decides on daylight saving; of an hour that a clock shows twice, it may take the
+    /// first at one call and the second at another. A year of 0 counts as 1900, a month of 0 as
+    /// January.
     operator long() const;
 
     /// "YYYY-MM-DD HH:MM:SS", or the half of it that the value has; empty when it has none.
