@@ -9,6 +9,7 @@
 #include <new>
 #include <ostream>
 #include <stdexcept>
+#include <type_traits>
 
 #include "text/convert.h"
 #include "text/fold.h"
@@ -126,21 +127,18 @@ std::basic_string<Char> _copy(Char const* s, std::basic_string<Char> const& noth
     throw std::bad_alloc();
 }
 
-/// Whether a text is ASCII without a NUL and no longer than most names. For such text a block is
-/// not worthwhile.
-template <class Char>
-bool _isPlainName(Char const* s, Char const* end) {
-    return end - s < 16 && std::all_of(s, end, [](Char c) { return c > 0 && c <= 0x7F; });
-}
-
-/// Converts a text. `convertBlock` is decodeBlock or encodeBlock; `bound` tells how many units are
+/// Converts a text. ASCII of no more than `direct` units needs no block: the string is filled while
+/// it is constructed. `convertBlock` is decodeBlock or encodeBlock; `bound` tells how many units are
 /// to be reserved. Inlined by force: short texts would suffer from a further call.
-template <class In, class Out, class ConvertBlock, class Bound>
+template <class Out, class In, class ConvertBlock, class Bound>
 [[gnu::always_inline]] inline std::basic_string<Out>
-_convert(In const* s, In const* end, std::basic_string<Out> const& nothing,
-         ConvertBlock convertBlock, Bound bound) try {
-    if (s == end) return nothing;
-    if (_isPlainName(s, end)) return std::basic_string<Out>(s, end);
+_convert(In const* s, std::size_t size, std::size_t direct, ConvertBlock convertBlock,
+         Bound bound) try {
+    if (size <= direct && isAscii(s, size)) {
+        auto const* const units = reinterpret_cast<std::make_unsigned_t<In> const*>(s);
+        return std::basic_string<Out>(units, units + size);
+    }
+    In const* const end = s + size;
     alignas(BLOCK_ALIGNMENT) Out block[BLOCK];
     auto const fill = [&] {
         return static_cast<std::size_t>(convertBlock(s, end, block, CAN_SHUFFLE) - block);
@@ -160,7 +158,7 @@ _convert(In const* s, In const* end, std::basic_string<Out> const& nothing,
 }
 
 std::wstring _decode(char const* s, std::size_t size) {
-    return _convert(s, s + size, _null_wstring, decodeBlock, countLeads);
+    return _convert<wchar_t>(s, size, size, decodeBlock, countLeads);
 }
 
 } // namespace
@@ -172,7 +170,8 @@ std::wstring make_wstring(wchar_t const* s) { return _copy(s, _null_wstring); }
 std::string make_string(wchar_t const* s) { return make_string(make_wstring(s)); }
 
 std::string make_string(std::wstring const& s) {
-    return _convert(s.data(), s.data() + s.size(), _null_string, encodeBlock, encodedBound);
+    constexpr std::size_t direct = 256; // Beyond it, a look at each character first takes longer.
+    return _convert<char>(s.data(), s.size(), direct, encodeBlock, encodedBound);
 }
 
 std::wstring make_wstring(char const* s) { return _decode(s, length(s)); }
