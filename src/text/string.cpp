@@ -135,6 +135,7 @@ template <class Out, class In, class ConvertBlock, class Bound>
 _convert(In const* s, std::size_t size, std::size_t direct, ConvertBlock convertBlock,
          Bound bound) try {
     if (size <= direct && isAscii(s, size)) {
+        // Without a sign, they take less to widen.
         auto const* const units = reinterpret_cast<std::make_unsigned_t<In> const*>(s);
         return std::basic_string<Out>(units, units + size);
     }
